@@ -321,6 +321,11 @@ TEST_F(MessageBlocksTest, RecordsOfTheVersionBeforeComeFirst) {
   EXPECT_THAT(read({.newest = 1}), ElementsAre(numbered(1)));
   EXPECT_THAT(read({.after = 8}), ElementsAre("{\"o\":1}", numbered(1)));
   EXPECT_THAT(read({.after = 9}), ElementsAre(numbered(1)));
+  EXPECT_THAT(read({.before = 9}), ElementsAre("{\"o\":1}"));
+  const auto reversed = RecordOrder::kNewestFirst;
+  EXPECT_THAT(read({.order = reversed}), ElementsAre(numbered(1), "{\"o\":1}", "{\"o\":1}"));
+  EXPECT_THAT(read({.newest = 2, .order = reversed}), ElementsAre(numbered(1), "{\"o\":1}"));
+  EXPECT_THAT(readLink({.order = reversed}), ElementsAre("{\"n\":5}", "{\"o\":2}"));
 }
 
 TEST_F(MessageBlocksTest, NumbersContinueAfterThoseOfTheVersionBefore) {

@@ -16,6 +16,17 @@ namespace {
 constexpr std::size_t kMostNames = 4096;
 constexpr std::int64_t kAfterAll = std::numeric_limits<std::int64_t>::max();
 
+// Selects the rows with the numbers from ?1 to ?2. The row that contains ?1 may begin before it.
+constexpr const char* kNewestRowFirst =
+    "SELECT id, records, block FROM message_blocks"
+    " WHERE id >= (SELECT ifnull(max(id), 0) FROM message_blocks WHERE id <= ?1)"
+    " AND id <= ?2 AND id + records > ?1 ORDER BY id DESC";
+
+std::size_t bytesOf(const BlockRecord& record) {
+  return record.name.size() + record.application.size() + record.clientName.size() +
+         record.serviceName.size() + record.payload.size();
+}
+
 }  // namespace
 
 SqliteCode BlockScan::readNumber(std::string_view sql, std::optional<std::int64_t> argument,
@@ -33,11 +44,14 @@ SqliteCode BlockScan::begin() {
   SqliteCode code =
       readNumber("SELECT id + records - 1 FROM message_blocks ORDER BY id DESC LIMIT 1",
                  std::nullopt, stored_);
-  last_ = stored_;
+  last_ = filter_.before.has_value() ? std::min(stored_, *filter_.before - 1) : stored_;
   next_ = std::max<std::int64_t>(filter_.after + 1, 1);
   if (code == SQLITE_OK) code = findRanges();
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
   if (code != SQLITE_OK) return code;
+  if (filter_.order == RecordOrder::kNewestFirst) {
+    return database_.prepare(std::string(kNewestRowFirst) + " LIMIT 1", read_);
+  }
   // Finds the row that contains the number, or else the first row after it.
   return database_.prepare(
       "SELECT id, records, block FROM message_blocks"
@@ -121,11 +135,7 @@ SqliteCode BlockScan::skipToNewest(std::uint64_t count) {
     return SQLITE_OK;
   }
   Statement rows;
-  SqliteCode code = database_.prepare(
-      "SELECT id, records, block FROM message_blocks"
-      " WHERE id >= (SELECT ifnull(max(id), 0) FROM message_blocks WHERE id <= ?1)"
-      " AND id <= ?2 AND id + records > ?1 ORDER BY id DESC",
-      rows);
+  SqliteCode code = database_.prepare(kNewestRowFirst, rows);
   for (std::size_t range = ranges_.size(); code == SQLITE_OK && range > 0 && missing_ > 0;) {
     --range;
     rows.bind(1, std::max(next_, ranges_[range].from));
@@ -144,7 +154,7 @@ SqliteCode BlockScan::skipToNewest(std::uint64_t count) {
 // with the first record that is wanted. Returns false if the block is damaged.
 bool BlockScan::countNewest() {
   std::vector<StoredRecordID> found;
-  while (nextRecord()) found.push_back(id());
+  while (nextRecord()) found.push_back(number());
   if (found.size() >= missing_) next_ = found[found.size() - missing_];
   missing_ -= std::min<std::uint64_t>(missing_, found.size());
   return !isDamaged();
@@ -174,8 +184,7 @@ SqliteCode BlockScan::nextBlock(bool& found) {
 
 bool BlockScan::nextRecord() {
   while (reader_.next()) {
-    const StoredRecordID number = id();
-    if (number < next_ || number > last_) continue;
+    if (number() < next_ || number() > last_) continue;
     const BlockRecordKind kind = reader_.record().kind;
     const bool isWanted = kind_.has_value() ? kind == *kind_ : kind != BlockRecordKind::kGap;
     if (isWanted && passes(reader_.record())) return true;
@@ -183,22 +192,71 @@ bool BlockScan::nextRecord() {
   return false;
 }
 
+SqliteCode BlockScan::previousBlock(bool& found) {
+  if (std::exchange(found, false)) last_ = std::min(last_, blockID_ - 1);
+  for (; !ranges_.empty(); ranges_.pop_back()) {
+    const std::int64_t first = std::max(next_, ranges_.back().from);
+    const std::int64_t last = std::min(last_, ranges_.back().to - 1);
+    if (first > last) continue;
+    read_.bind(1, first);
+    read_.bind(2, last);
+    const SqliteCode code = read_.step();
+    found = code == SQLITE_ROW;
+    if (found) load(read_);
+    read_.reset();
+    if (code != SQLITE_ROW && code != SQLITE_DONE) return code;
+    if (!found) continue;
+    while (nextRecord()) passing_.push_back({number(), bytesOf(reader_.record())});
+    return isDamaged() ? SQLITE_CORRUPT : SQLITE_OK;
+  }
+  return SQLITE_OK;
+}
+
+bool BlockScan::previousRecord() {
+  if (!copies_.empty()) copies_.pop_back();
+  if (copies_.empty() && !passing_.empty()) copyNewest();
+  return !copies_.empty();
+}
+
+// Copies the newest of the records that are not copied yet.
+void BlockScan::copyNewest() {
+  std::size_t first = passing_.size();
+  for (std::size_t bytes = 0; first > 0 && bytes < kBytesPerPiece;)
+    bytes += passing_[--first].bytes;
+  reader_.open(block_, records_);
+  for (std::size_t wanted = first; wanted < passing_.size() && reader_.next();) {
+    if (number() != passing_[wanted].id) continue;
+    ++wanted;
+    Copy copy{number(), reader_.record(), std::make_unique<char[]>(bytesOf(reader_.record()))};
+    char* end = copy.texts.get();
+    for (std::string_view* const text :
+         {&copy.record.name, &copy.record.application, &copy.record.clientName,
+          &copy.record.serviceName, &copy.record.payload}) {
+      text->copy(end, text->size());
+      *text = {end, text->size()};
+      end += text->size();
+    }
+    copies_.push_back(std::move(copy));
+  }
+  passing_.resize(first);
+}
+
 bool BlockScan::passes(const BlockRecord& record) {
   if (!isWithinTimes(filter_, record.time)) return false;
   if (!kind_.has_value()) return true;
   if (kind_ == BlockRecordKind::kEvent) {
     return hasName(record.name) &&
-           (!filter_.acceptsEvent || filter_.acceptsEvent({id(), record.time, record.name,
+           (!filter_.acceptsEvent || filter_.acceptsEvent({number(), record.time, record.name,
                                                            record.payload, record.application}));
   }
   for (const NumberMatch& match : filter_.numbers) {
-    const std::int64_t number = match.column == kLinkSessionID  ? record.sessionID
-                                : match.column == kLinkCategory ? record.category
-                                                                : record.type;
-    if (std::ranges::find(match.numbers, number) == match.numbers.end()) return false;
+    const std::int64_t value = match.column == kLinkSessionID  ? record.sessionID
+                               : match.column == kLinkCategory ? record.category
+                                                               : record.type;
+    if (std::ranges::find(match.numbers, value) == match.numbers.end()) return false;
   }
   if (!hasName(record.serviceName)) return false;
-  return !filter_.accepts || filter_.accepts(linkRecord(id(), record));
+  return !filter_.accepts || filter_.accepts(linkRecord(number(), record));
 }
 
 bool BlockScan::hasName(std::string_view name) {

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <functional>
 #include <map>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -23,7 +24,8 @@ namespace halvox::platform::linux_ {
 // thread of its database and does not own its arguments. After an error the scan is over.
 //
 //   begin(); bool found = false; then nextBlock(found), and nextRecord() while it is true, until
-//   nothing is found
+//   nothing is found; or, from the newest record to the oldest, previousBlock() and
+//   previousRecord()
 class BlockScan {
  public:
   // Reads both kinds, in the order of storing, if `kind` is empty. Of the filter only the times and
@@ -43,9 +45,17 @@ class BlockScan {
   // Moves to the next record of the block that passes the filter. The record's views are valid
   // until the next call.
   [[nodiscard]] bool nextRecord();
-  [[nodiscard]] const BlockRecord& record() const { return reader_.record(); }
-  [[nodiscard]] StoredRecordID id() const { return blockID_ + reader_.index(); }
-  // Returns true if nextRecord() has found damage. The scan is over then.
+  // The same in the opposite order. A block can be unpacked only from its beginning:
+  // previousBlock() unpacks it once to find the records that pass, and fails with SQLITE_CORRUPT if
+  // it is damaged. previousRecord() unpacks it again for each megabyte of them, because a block of
+  // repetitive messages may be hundreds of times as long unpacked.
+  [[nodiscard]] SqliteCode previousBlock(bool& found);
+  [[nodiscard]] bool previousRecord();
+  [[nodiscard]] const BlockRecord& record() const {
+    return copies_.empty() ? reader_.record() : copies_.back().record;
+  }
+  [[nodiscard]] StoredRecordID id() const { return copies_.empty() ? number() : copies_.back().id; }
+  // Returns true if reading a block has found damage. The scan is over then.
   [[nodiscard]] bool isDamaged() const { return reader_.isDamaged(); }
 
   // Returns the number of the last record that the pass looks at, whether or not it passes the
@@ -58,6 +68,17 @@ class BlockScan {
     std::int64_t from;
     std::int64_t to;
   };
+  // A record of the loaded block that passes, and the length of its texts.
+  struct Passing {
+    StoredRecordID id;
+    std::size_t bytes;
+  };
+  // A record with texts of its own, which its views show.
+  struct Copy {
+    StoredRecordID id;
+    BlockRecord record;
+    std::unique_ptr<char[]> texts;
+  };
   // Each block with records that pass has at least one of these keys.
   using Alternatives = std::vector<BlockKey>;
 
@@ -69,6 +90,9 @@ class BlockScan {
   [[nodiscard]] SqliteCode readNumber(std::string_view sql, std::optional<std::int64_t> argument,
                                       std::int64_t& number);
   void load(const Statement& row);
+  void copyNewest();
+  // Returns the number of the record that the block's reader is at.
+  [[nodiscard]] StoredRecordID number() const { return blockID_ + reader_.index(); }
   [[nodiscard]] bool passes(const BlockRecord& record);
   [[nodiscard]] bool hasName(std::string_view name);
 
@@ -88,6 +112,10 @@ class BlockScan {
   std::int64_t blockID_ = 0;
   std::int64_t records_ = 0;
   MessageBlockReader reader_;
+  // For the opposite order: the records that previousRecord() has yet to copy, and those that it
+  // has copied, both oldest first.
+  std::vector<Passing> passing_;
+  std::vector<Copy> copies_;
   std::map<std::string, bool, std::less<>> names_;  // which names pass
 };
 

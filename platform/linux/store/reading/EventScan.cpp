@@ -17,11 +17,15 @@ SqliteCode EventScan::begin() {
   // Begin with the record that holds the event `after`, because its second event may be newer.
   bounds_.first = recordOf(filter_.after);
   SqliteCode code = findBounds(database_, "analytics_records", "analytics_spans", filter_, bounds_);
+  if (filter_.before.has_value()) {
+    bounds_.last = std::min(bounds_.last, recordOf(*filter_.before - 1));
+  }
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
   if (code != SQLITE_OK) return code;
   return database_.prepare(
-      "SELECT id, time, name_id, twin_time, twin_name_id, payload FROM analytics_records"
-      " WHERE id BETWEEN ?1 AND ?2 ORDER BY id",
+      std::string("SELECT id, time, name_id, twin_time, twin_name_id, payload"
+                  " FROM analytics_records WHERE id BETWEEN ?1 AND ?2 ORDER BY id") +
+          (filter_.order == RecordOrder::kNewestFirst ? " DESC" : ""),
       read_);
 }
 
@@ -64,11 +68,16 @@ SqliteCode EventScan::next(Piece& piece) {
   for (int records = 0; records < kLooksPerPiece; ++records) {
     code = read_.step();
     if (code != SQLITE_ROW) break;
-    bounds_.first = read_.integer(kID) + 1;
+    const bool isReversed = filter_.order == RecordOrder::kNewestFirst;
+    if (isReversed) {
+      bounds_.last = read_.integer(kID) - 1;
+    } else {
+      bounds_.first = read_.integer(kID) + 1;
+    }
     bool hasPayload = false;
-    for (const int which : {0, 1}) {
+    for (const int place : {0, 1}) {
       Event event{};
-      if (!readEvent(read_, which, event)) continue;
+      if (!readEvent(read_, isReversed ? 1 - place : place, event)) continue;
       if (!hasPayload) {
         // Copy the payload once for both events of a record.
         piece.payloads.emplace_back(read_.text(kPayload));
@@ -97,7 +106,8 @@ bool EventScan::readEvent(const Statement& row, int which, Event& event) {
 }
 
 bool EventScan::passes(const Event& event) {
-  return event.id > after_ && isWithinTimes(filter_, event.time) && name(event.nameID).matches;
+  return event.id > after_ && (!filter_.before.has_value() || event.id < *filter_.before) &&
+         isWithinTimes(filter_, event.time) && name(event.nameID).matches;
 }
 
 // Looks a name up at its first use and keeps it. There are few names, and reading all of them at

@@ -11,10 +11,10 @@
 
 namespace halvox::platform::linux_ {
 
-// One pass over the stored events that pass a filter. Reads in pieces, and holds no snapshot
-// between two pieces; StoreReader says why. Ends with the last event that was stored when it began.
-// Belongs to the thread of its database and does not own its arguments. After an error the scan is
-// over.
+// One pass over the stored events that pass a filter, in the filter's order. Reads in pieces, and
+// holds no snapshot between two pieces; StoreReader says why. Reads no event that was stored after
+// it began. Belongs to the thread of its database and does not own its arguments. After an error
+// the scan is over.
 //
 // An event's ID is twice the number of its record, plus 1 for the twin.
 class EventScan {
@@ -39,8 +39,8 @@ class EventScan {
   [[nodiscard]] SqliteCode next(Piece& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
 
-  // Returns the last event that the pass looks at, whether or not it passes the filter. Known after
-  // begin().
+  // Returns the last event that a pass in the order of storing looks at, whether or not it passes
+  // the filter. Known after begin().
   [[nodiscard]] StoredRecordID last() const { return 2 * bounds_.last + 1; }
 
   [[nodiscard]] std::string_view nameOf(std::int64_t nameID) { return name(nameID).text; }

@@ -69,22 +69,24 @@ SqliteCode RecordScan::begin() {
   bounds_.first = std::max<std::int64_t>(filter_.after + 1, 1);
   SqliteCode code = findBounds(database_, std::string(table_.records), std::string(table_.spans),
                                filter_, bounds_);
+  if (filter_.before.has_value()) bounds_.last = std::min(bounds_.last, *filter_.before - 1);
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
-  return code == SQLITE_OK ? prepare("ASC", read_) : code;
+  return code == SQLITE_OK ? prepare(filter_.order, read_) : code;
 }
 
-SqliteCode RecordScan::prepare(std::string_view order, Statement& statement) {
+SqliteCode RecordScan::prepare(RecordOrder order, Statement& statement) {
   std::string sql = "SELECT id, time";
   for (const RecordColumn& column : table_.columns) sql.append(", ").append(column.name);
   sql.append(" FROM ").append(table_.records);
-  sql.append(" WHERE id BETWEEN ?1 AND ?2 ORDER BY id ").append(order);
+  sql.append(" WHERE id BETWEEN ?1 AND ?2 ORDER BY id");
+  if (order == RecordOrder::kNewestFirst) sql.append(" DESC");
   return database_.prepare(sql, statement);
 }
 
 SqliteCode RecordScan::skipToNewest(std::uint64_t count) {
   Statement statement;
   // Read from the newest record backwards, to read no more records than needed.
-  SqliteCode code = prepare("DESC", statement);
+  SqliteCode code = prepare(RecordOrder::kNewestFirst, statement);
   if (code != SQLITE_OK) return code;
   statement.bind(1, bounds_.first);
   statement.bind(2, bounds_.last);
@@ -110,7 +112,11 @@ SqliteCode RecordScan::next(std::vector<StoredRecord>& piece) {
     if (code != SQLITE_ROW) break;
     // Advance past a record that does not pass the filter, too. The next piece must not read it
     // again.
-    bounds_.first = read_.integer(kID) + 1;
+    if (filter_.order == RecordOrder::kNewestFirst) {
+      bounds_.last = read_.integer(kID) - 1;
+    } else {
+      bounds_.first = read_.integer(kID) + 1;
+    }
     if (passes(read_)) piece.push_back(read(read_, bytes));
     if (piece.size() >= kRecordsPerPiece || bytes >= kBytesPerPiece) break;
   }

@@ -33,10 +33,10 @@ constexpr std::size_t kRecordsPerPiece = 512;
 constexpr std::size_t kBytesPerPiece = 1U << 20U;
 constexpr int kLooksPerPiece = 50'000;
 
-// One pass over the records of one kind that pass a filter. Reads in pieces, and holds no snapshot
-// between two pieces; StoreReader says why. Ends with the last record that was stored when it
-// began. Belongs to the thread of its database and does not own its arguments. After an error the
-// scan is over.
+// One pass over the records of one kind that pass a filter, in the filter's order. Reads in pieces,
+// and holds no snapshot between two pieces; StoreReader says why. Reads no record that was stored
+// after it began. Belongs to the thread of its database and does not own its arguments. After an
+// error the scan is over.
 class RecordScan {
  public:
   RecordScan(Database& database, const RecordTable& table, const RecordFilter& filter)
@@ -47,15 +47,15 @@ class RecordScan {
   // Reads the next piece. A piece may be empty although more follow. Only isAtEnd() shows the end.
   [[nodiscard]] SqliteCode next(std::vector<StoredRecord>& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
-  // Returns the last record that the pass looks at, whether or not it passes the filter. Known
-  // after begin().
+  // Returns the last record that a pass in the order of storing looks at, whether or not it passes
+  // the filter. Known after begin().
   [[nodiscard]] StoredRecordID last() const { return bounds_.last; }
 
  private:
   [[nodiscard]] bool passes(const Statement& row) const;
   [[nodiscard]] StoredRecord read(const Statement& row, std::size_t& bytes) const;
   [[nodiscard]] SqliteCode skipToNewest(std::uint64_t count);
-  [[nodiscard]] SqliteCode prepare(std::string_view order, Statement& statement);
+  [[nodiscard]] SqliteCode prepare(RecordOrder order, Statement& statement);
 
   Database& database_;
   const RecordTable& table_;

@@ -34,6 +34,8 @@ std::string immutableURI(const std::string& path) {
   return uri + "?immutable=1";
 }
 
+bool isOver(const RecordFilter& filter) { return filter.isEnough && filter.isEnough(); }
+
 }  // namespace
 
 Result<void, StoreError> StoreReader::open(const std::filesystem::path& directory) {
@@ -113,20 +115,34 @@ Result<void, StoreError> StoreReader::forEachMessage(BlockRecordKind kind,
   BlockScan blocks(database_, kind, filter);
   SqliteCode code = blocks.begin();
   if (blocks.isDamaged()) return damagedBlock(blocks.id());
-  if (code == SQLITE_OK && (!filter.newest.has_value() || blocks.missing() > 0)) {
-    RecordFilter before = filter;
-    if (filter.newest.has_value()) before.newest = blocks.missing();
-    code = old(before, *version);
-  }
-  for (bool found = false; code == SQLITE_OK;) {
-    code = blocks.nextBlock(found);
-    if (!found) break;
-    while (blocks.nextRecord()) deliver(blocks.id(), blocks.record());
-    if (blocks.isDamaged()) return damagedBlock(blocks.id());
-  }
+  const auto readOld = [&] {
+    if (code != SQLITE_OK || (filter.newest.has_value() && blocks.missing() == 0)) return;
+    RecordFilter rest = filter;
+    if (filter.newest.has_value()) rest.newest = blocks.missing();
+    code = old(rest, *version);
+  };
+  const bool isReversed = filter.order == RecordOrder::kNewestFirst;
+  if (!isReversed) readOld();
+  if (code == SQLITE_OK && !isOver(filter)) code = readBlocks(blocks, filter, deliver);
+  if (blocks.isDamaged()) return damagedBlock(blocks.id());
+  if (isReversed && !isOver(filter)) readOld();
   if (code != SQLITE_OK) return failure(code);
   lastRead_ = std::max(lastRead_, blocks.last());
   return {};
+}
+
+template <typename Deliver>
+SqliteCode StoreReader::readBlocks(BlockScan& blocks, const RecordFilter& filter, Deliver deliver) {
+  const bool isReversed = filter.order == RecordOrder::kNewestFirst;
+  for (bool found = false;;) {
+    const SqliteCode code = isReversed ? blocks.previousBlock(found) : blocks.nextBlock(found);
+    if (code != SQLITE_OK || !found) return code;
+    while (isReversed ? blocks.previousRecord() : blocks.nextRecord()) {
+      deliver(blocks.id(), blocks.record());
+      if (isOver(filter)) return SQLITE_OK;
+    }
+    if (blocks.isDamaged()) return SQLITE_CORRUPT;
+  }
 }
 
 Result<void, StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
@@ -150,6 +166,7 @@ SqliteCode StoreReader::readOldEvents(const RecordFilter& filter, const EventCal
     code = scan.next(piece);
     for (const EventScan::Event& event : piece.events) {
       callback({event.id, event.time, scan.nameOf(event.nameID), piece.payloads[event.payload]});
+      if (isOver(filter)) return SQLITE_OK;
     }
   }
   // For an empty table last() is 1, which is also the number of the first record in a block.
@@ -184,7 +201,10 @@ SqliteCode StoreReader::readRows(const RecordTable& table, const RecordFilter& f
   std::vector<StoredRecord> piece;
   while (code == SQLITE_OK && !scan.isAtEnd()) {
     code = scan.next(piece);
-    for (const StoredRecord& record : piece) callback(record);
+    for (const StoredRecord& record : piece) {
+      callback(record);
+      if (isOver(filter)) return SQLITE_OK;
+    }
   }
   if (code == SQLITE_OK) lastRead_ = scan.last();
   return code;

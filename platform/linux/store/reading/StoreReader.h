@@ -18,6 +18,8 @@
 
 namespace halvox::platform::linux_ {
 
+class BlockScan;
+
 // The position of a record among the records of its kind, in the order of storing. IDs only grow
 // and may have gaps. They start again from 1 when a new database replaces the old one.
 using StoredRecordID = std::int64_t;
@@ -81,20 +83,27 @@ struct StoredKinds {
   bool losses = false;
 };
 
-// Which records to read. A member that is not set selects everything.
+enum class RecordOrder : std::uint8_t { kOldestFirst, kNewestFirst };
+
+// Which records to read, and in which order. A member that is not set selects everything.
 struct RecordFilter {
   // Patterns for fnmatch(3). The name must match at least one of them. Kinds without a name ignore
   // them.
   std::vector<std::string> names{};
-  std::optional<double> since{};          // seconds since 1970, inclusive
-  std::optional<double> until{};          // seconds since 1970, exclusive
-  StoredRecordID after = 0;               // only records stored after this one
-  std::optional<std::uint64_t> newest{};  // at most this many, the newest
-  std::vector<NumberMatch> numbers{};     // all must match; events ignore them
+  std::optional<double> since{};           // seconds since 1970, inclusive
+  std::optional<double> until{};           // seconds since 1970, exclusive
+  StoredRecordID after = 0;                // only records stored after this one
+  std::optional<StoredRecordID> before{};  // only records stored before this one
+  std::optional<std::uint64_t> newest{};   // at most this many, the newest
+  std::vector<NumberMatch> numbers{};      // all must match; events ignore them
   // A further condition, called only for records that meet all others. Events ignore it.
   std::function<bool(const StoredRecord&)> accepts{};
   // The same for events; the other kinds ignore it.
   std::function<bool(const StoredEvent&)> acceptsEvent{};
+  RecordOrder order = RecordOrder::kOldestFirst;
+  // Asked after each record that was delivered. The pass ends when it returns true, and must then
+  // return true again.
+  std::function<bool()> isEnough{};
 };
 
 // Reads a store without changing it, whether or not a service writes to it at the same time.
@@ -113,9 +122,10 @@ class StoreReader {
   // if there is no store or nothing was stored yet, or with kDamaged, kNewerVersion or kCannotOpen.
   Result<void, StoreError> open(const std::filesystem::path& directory);
 
-  // Calls `callback` on this thread for each event that passes the filter, in the order of storing.
-  // Delivers the events that were stored when the call began. Waits up to one second for a locked
-  // database. If there is an error, the events before it have been delivered.
+  // Calls `callback` on this thread for each event that passes the filter, in the order of storing
+  // or in the opposite order. Delivers the events that were stored when the call began. Waits up to
+  // one second for a locked database. If there is an error, the events before it have been
+  // delivered. Memory does not grow with the number of events in either order.
   Result<void, StoreError> forEachEvent(const RecordFilter& filter, const EventCallback& callback);
   // Reads the records of another kind in the same way. If the store has an older version that lacks
   // the kind, there are no such records, which is not an error.
@@ -137,7 +147,8 @@ class StoreReader {
 
   // Returns the last record that the last successful call of forEachEvent(), forEachRecord() or,
   // for messages, forEachItem() looked at, whether or not it passed the filter. A call of the same
-  // function that continues after that record misses none.
+  // function that continues after that record misses none. Without meaning after a pass
+  // that RecordFilter::isEnough ended or that `order` reversed.
   [[nodiscard]] StoredRecordID lastRead() const { return lastRead_; }
 
   // Returns true if no store is open, or if the path leads to another database or to none now. Then
@@ -152,11 +163,14 @@ class StoreReader {
   [[nodiscard]] Failure<StoreError> damagedBlock(StoredRecordID after) const;
   [[nodiscard]] Result<void, StoreError> outcome(SqliteCode code) const;
   Result<void, StoreError> openDatabase();
-  // Calls `deliver` for each record in blocks. First calls `old`, which reads the records that are
-  // not in blocks and sets lastRead_.
+  // Calls `deliver` for each record in blocks. Before that, or after it in the opposite order,
+  // calls `old`, which reads the records that are not in blocks and sets lastRead_.
   template <typename ReadOld, typename Deliver>
   Result<void, StoreError> forEachMessage(BlockRecordKind kind, const RecordFilter& filter,
                                           ReadOld old, Deliver deliver);
+  template <typename Deliver>
+  [[nodiscard]] SqliteCode readBlocks(BlockScan& blocks, const RecordFilter& filter,
+                                      Deliver deliver);
   [[nodiscard]] SqliteCode readOldEvents(const RecordFilter& filter, const EventCallback& callback);
   [[nodiscard]] SqliteCode readRows(const RecordTable& table, const RecordFilter& filter,
                                     const RecordCallback& callback);

@@ -1,5 +1,6 @@
 #include "platform/linux/store/reading/StoreReader.h"
 
+#include <algorithm>
 #include <string>
 #include <vector>
 
@@ -117,6 +118,61 @@ TEST_F(StoreReaderTest, GivesOneOfTheTwoEventsOfAMessage) {
   ASSERT_TRUE(allIsStored());
   EXPECT_THAT(read({.newest = 1}), SizeIs(1));
   EXPECT_THAT(read({.names = {"second"}}), SizeIs(1));
+}
+
+TEST_F(StoreReaderTest, ReadsTheNewestEventFirstIfAskedFor) {
+  store1000(3000);
+  auto expected = read({});
+  std::ranges::reverse(expected);
+  const auto reversed = RecordOrder::kNewestFirst;
+
+  EXPECT_EQ(read({.order = reversed}), expected);
+  EXPECT_THAT(read({.newest = 2, .order = reversed}), ElementsAre(numbered(2999), numbered(2998)));
+  EXPECT_THAT(read({.names = {"odd"}, .since = 1500.0, .until = 1504.0, .order = reversed}),
+              ElementsAre(numbered(503), numbered(501)));
+  EXPECT_THAT(read({.names = {"x"}, .order = reversed}), IsEmpty());
+}
+
+TEST_F(StoreReaderTest, ReadsTheEventsBetweenTwoNumbersInBothOrders) {
+  store1000(3000);
+
+  EXPECT_THAT(read({.after = 1000, .before = 1003}), ElementsAre(numbered(1000), numbered(1001)));
+  EXPECT_THAT(read({.after = 1000, .before = 1003, .order = RecordOrder::kNewestFirst}),
+              ElementsAre(numbered(1001), numbered(1000)));
+  EXPECT_THAT(read({.before = 3, .newest = 1}), ElementsAre(numbered(1)));
+  EXPECT_THAT(read({.before = 1}), IsEmpty());
+}
+
+TEST_F(StoreReaderTest, EndsWhenTheCallerHasEnough) {
+  store1000(3000);
+  for (const auto order : {RecordOrder::kOldestFirst, RecordOrder::kNewestFirst}) {
+    int count = 0;
+    RecordFilter filter{.order = order, .isEnough = [&count] { return count >= 3; }};
+    StoreReader reader;
+    ASSERT_TRUE(reader.open(options.directory));
+
+    ASSERT_TRUE(reader.forEachEvent(filter, [&count](const StoredEvent&) { ++count; }));
+
+    EXPECT_EQ(count, 3);
+  }
+}
+
+// Long payloads that are alike make a block that is many times as long when it is unpacked, and is
+// copied in several pieces.
+TEST_F(StoreReaderTest, ReadsBlocksOfLongPayloadsInBothOrders) {
+  start();
+  const std::string text(50'000, 'x');
+  for (std::int64_t number = 0; number < 300; ++number) {
+    service->sendAnalyticsEventLazy("long", [&text, number] {
+      return Dictionary{{"text", text}, {"n", number}};
+    });
+    ASSERT_TRUE(allIsStored());
+  }
+  auto expected = read({});
+  ASSERT_THAT(expected, SizeIs(300));
+  std::ranges::reverse(expected);
+
+  EXPECT_TRUE(read({.order = RecordOrder::kNewestFirst}) == expected);
 }
 
 TEST_F(StoreReaderTest, ReadsFromAGivenEventOn) {
