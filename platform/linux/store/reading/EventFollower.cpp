@@ -17,10 +17,11 @@ namespace halvox::platform::linux_ {
 namespace {
 
 // inotify reports the write to the write-ahead log, but readers see the commit only a moment later,
-// which inotify does not report. After each report the follower therefore looks three more times,
-// 25 ms apart.
-constexpr int kLooksAgain = 3;
-constexpr long kLookAgainNanoseconds = 25'000'000;
+// which inotify does not report. After each report the follower therefore looks again after these
+// times, in milliseconds. The last two are for a service that was suspended between the write and
+// the commit by a busy machine.
+constexpr std::array kLooksAgain{25, 25, 25, 250, 1000};
+constexpr long kNanosecondsPerMillisecond = 1'000'000;
 
 constexpr std::uint32_t kWatched =
     IN_MODIFY | IN_CREATE | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
@@ -81,10 +82,13 @@ Result<void, StoreError> EventFollower::deliverBy(Read read) {
                                directory_.native() + ": the directory was removed"};
   }
   const bool timerRan = readTimer();
-  if (change == Change::kStoreWritten) looksLeft_ = kLooksAgain;
+  if (change == Change::kStoreWritten) looksLeft_ = kLooksAgain.size();
   if (change == Change::kNone && !timerRan && started_) return {};
   if (looksLeft_ > 0) startTimer();
   if (reader_.isReplaced()) {
+    // Deliver what the service stored in the old database before it was replaced. That database may
+    // be damaged: it was perhaps replaced for this reason.
+    if (started_ && read()) filter_.after = std::max(filter_.after, reader_.lastRead());
     const auto isOpen = reopen();
     if (!isOpen) return isOpen.error();
     if (!*isOpen) return {};
@@ -136,13 +140,15 @@ EventFollower::Change EventFollower::readChanges() {
 bool EventFollower::readTimer() {
   std::uint64_t expirations = 0;
   if (::read(timer_.get(), &expirations, sizeof expirations) != sizeof expirations) return false;
-  looksLeft_ = std::max(0, looksLeft_ - 1);
+  if (looksLeft_ > 0) --looksLeft_;
   return true;
 }
 
 void EventFollower::startTimer() {
   itimerspec delay{};
-  delay.it_value.tv_nsec = kLookAgainNanoseconds;
+  const int milliseconds = kLooksAgain[kLooksAgain.size() - looksLeft_];
+  delay.it_value.tv_sec = milliseconds / 1000;
+  delay.it_value.tv_nsec = milliseconds % 1000 * kNanosecondsPerMillisecond;
   ::timerfd_settime(timer_.get(), 0, &delay, nullptr);
 }
 

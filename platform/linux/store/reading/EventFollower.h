@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <filesystem>
 
 #include "platform/linux/base/Result.h"
@@ -21,6 +22,11 @@ class EventFollower {
   // stored already and pass the filter. Fails like StoreReader::open(), or with kCannotOpen or
   // kMissing if the directory cannot be watched.
   Result<void, StoreError> open(const std::filesystem::path& directory, const RecordFilter& filter);
+  // Between open() and the first deliver(): the reader of the opened store, and another filter for
+  // the deliveries. A caller can look into the store first to decide where to begin; what is stored
+  // meanwhile is delivered.
+  [[nodiscard]] StoreReader& reader() { return reader_; }
+  void beginWith(const RecordFilter& filter) { filter_ = filter; }
   // Becomes readable (poll) when deliver() should be called. Owned by this object.
   [[nodiscard]] int descriptor() const { return poller_.get(); }
   // Calls `callback` on this thread for each event that was stored since the last delivery. Does
@@ -50,7 +56,7 @@ class EventFollower {
   UniqueFd timer_;
   UniqueFd poller_;
   bool started_ = false;
-  int looksLeft_ = 0;
+  std::size_t looksLeft_ = 0;
 };
 
 }  // namespace halvox::platform::linux_

@@ -111,6 +111,21 @@ TEST_F(EventFollowerTest, ContinuesWithADatabaseThatReplacedTheOldOne) {
   EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2)));
 }
 
+TEST_F(EventFollowerTest, DeliversTheLastEventsOfADatabaseThatWasReplaced) {
+  start();
+  ASSERT_TRUE(follower.open(options.directory, {}));
+  send(1);
+  ASSERT_TRUE(follow(1));
+  send(2);
+  ASSERT_TRUE(allIsStored());
+  for (const char* suffix : {"", "-wal", "-shm"}) {
+    std::filesystem::remove(database().native() + suffix);
+  }
+  send(3);
+  ASSERT_TRUE(follow(3));
+  EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2), numbered(3)));
+}
+
 TEST_F(EventFollowerTest, WaitsForTheNewDatabaseWhileThereIsNone) {
   start();
   ASSERT_TRUE(follower.open(options.directory, {}));
