@@ -46,6 +46,11 @@ SqliteCode BlockScan::begin() {
                  std::nullopt, stored_);
   last_ = filter_.before.has_value() ? std::min(stored_, *filter_.before - 1) : stored_;
   next_ = std::max<std::int64_t>(filter_.after + 1, 1);
+  if (code == SQLITE_OK && filter_.after > 0) {
+    std::int64_t first = 0;
+    code = readNumber("SELECT ifnull(min(id), 0) FROM message_blocks", std::nullopt, first);
+    hasGap_ = first > next_;
+  }
   if (code == SQLITE_OK) code = findRanges();
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
   if (code != SQLITE_OK) return code;
@@ -179,6 +184,10 @@ SqliteCode BlockScan::nextBlock(bool& found) {
   found = code == SQLITE_ROW;
   if (found) load(read_);
   read_.reset();
+  // Numbers have no gaps: each row begins with the number after the row before it. Retention
+  // removes the rows with the lowest numbers, which is not a gap for a pass that has not begun.
+  if (hasBegun_ || filter_.after > 0) hasGap_ = hasGap_ || !found || blockID_ > next_;
+  hasBegun_ = true;
   return code == SQLITE_ROW || code == SQLITE_DONE ? SQLITE_OK : code;
 }
 

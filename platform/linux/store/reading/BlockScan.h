@@ -58,6 +58,10 @@ class BlockScan {
   // Returns true if reading a block has found damage. The scan is over then.
   [[nodiscard]] bool isDamaged() const { return reader_.isDamaged(); }
 
+  // Returns true if records between the first and the last one that nextBlock() looked at, or after
+  // RecordFilter::after, were removed from the store before they were read.
+  [[nodiscard]] bool hasGap() const { return hasGap_; }
+
   // Returns the number of the last record that the pass looks at, whether or not it passes the
   // filter. Known after begin(). 0 if there are no blocks.
   [[nodiscard]] StoredRecordID last() const { return stored_; }
@@ -107,6 +111,8 @@ class BlockScan {
   std::size_t range_ = 0;
   StoredRecordID stored_ = 0;
   std::uint64_t missing_ = 0;
+  bool hasBegun_ = false;
+  bool hasGap_ = false;
   Statement read_;
   std::string block_;
   std::int64_t blockID_ = 0;

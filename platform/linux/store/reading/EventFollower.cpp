@@ -76,6 +76,7 @@ Result<void, StoreError> EventFollower::deliver(const RecordTable& table,
 
 template <typename Read>
 Result<void, StoreError> EventFollower::deliverBy(Read read) {
+  hasGap_ = false;
   const Change change = readChanges();
   if (change == Change::kDirectoryGone) {
     return Failure<StoreError>{StoreError::kMissing,
@@ -99,6 +100,7 @@ Result<void, StoreError> EventFollower::deliverBy(Read read) {
   // record passes the filter, as with `newest` 0, all stored records would otherwise count as new
   // the next time.
   if (done) filter_.after = std::max(filter_.after, reader_.lastRead());
+  hasGap_ = done && reader_.hasGap();
   // `newest` limits only the first delivery, because everything that is stored later is new.
   filter_.newest.reset();
   return done;

@@ -33,6 +33,8 @@ class EventFollower {
   // not wait for events. Returns an error if the directory was removed or the database cannot be
   // read. Following then ends.
   Result<void, StoreError> deliver(const StoreReader::EventCallback& callback);
+  // Returns true if the store removed records before the last delivery reached them.
+  [[nodiscard]] bool hasGap() const { return hasGap_; }
   // Delivers the records of another kind in the same way. Do not mix kinds in one follower, because
   // it remembers only one position.
   Result<void, StoreError> deliver(const RecordTable& table,
@@ -56,6 +58,7 @@ class EventFollower {
   UniqueFd timer_;
   UniqueFd poller_;
   bool started_ = false;
+  bool hasGap_ = false;
   std::size_t looksLeft_ = 0;
 };
 

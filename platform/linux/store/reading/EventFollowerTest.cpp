@@ -78,6 +78,31 @@ TEST_F(EventFollowerTest, LosesAndRepeatsNothingUnderLoad) {
   }
 }
 
+TEST_F(EventFollowerTest, KnowsThatTheStoreRemovedEventsBeforeItsDelivery) {
+  start();
+  for (std::int64_t number = 0; number < 3; ++number) {
+    send(number);
+    ASSERT_TRUE(allIsStored());
+  }
+  ASSERT_TRUE(follower.open(options.directory, {.after = 1}));
+  ASSERT_TRUE(follow(2));
+  EXPECT_FALSE(follower.hasGap());
+  // One that was delivered is removed.
+  execute(database(), "DELETE FROM message_blocks WHERE id <= 3");
+  send(3);
+  ASSERT_TRUE(follow(3));
+  EXPECT_FALSE(follower.hasGap());
+
+  send(4);
+  ASSERT_TRUE(allIsStored());
+  execute(database(), "DELETE FROM message_blocks WHERE id <= 5");
+  send(5);
+  ASSERT_TRUE(allIsStored());
+  ASSERT_TRUE(follow(4));
+  EXPECT_TRUE(follower.hasGap());
+  EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2), numbered(3), numbered(5)));
+}
+
 TEST_F(EventFollowerTest, AppliesItsFilterToWhatComes) {
   start();
   ASSERT_TRUE(follower.open(options.directory, {.names = {"wanted"}}));

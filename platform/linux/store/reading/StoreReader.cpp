@@ -111,6 +111,7 @@ Result<void, StoreError> StoreReader::forEachMessage(BlockRecordKind kind,
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;
+  hasGap_ = false;
   if (*version < kBlocksSinceVersion) return outcome(old(filter, *version));
   BlockScan blocks(database_, kind, filter);
   SqliteCode code = blocks.begin();
@@ -127,6 +128,8 @@ Result<void, StoreError> StoreReader::forEachMessage(BlockRecordKind kind,
   if (blocks.isDamaged()) return damagedBlock(blocks.id());
   if (isReversed && !isOver(filter)) readOld();
   if (code != SQLITE_OK) return failure(code);
+  // lastRead_ is that of the old tables here. Between their numbers and those of blocks is a gap.
+  hasGap_ = blocks.hasGap() && lastRead_ <= filter.after;
   lastRead_ = std::max(lastRead_, blocks.last());
   return {};
 }
@@ -191,6 +194,7 @@ Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;
+  hasGap_ = false;
   return outcome(rows(filter, *version));
 }
 

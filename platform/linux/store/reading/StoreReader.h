@@ -132,6 +132,11 @@ class StoreReader {
   Result<void, StoreError> forEachRecord(const RecordTable& table, const RecordFilter& filter,
                                          const RecordCallback& callback);
 
+  // Returns true if the store removed events or link messages of the last pass before the pass
+  // reached them, after it had begun or after RecordFilter::after. Only for a pass in the order of
+  // storing. A callback that waits, such as for a person, may cause it.
+  [[nodiscard]] bool hasGap() const { return hasGap_; }
+
   // Calls `callback` on this thread for each record of several kinds within a range of time. Events
   // and link messages come in the order of storing; the other kinds are merged with them by time.
   // Uses only the times of the filter and, for messages, `after`: a value of lastRead() makes this
@@ -181,6 +186,7 @@ class StoreReader {
   std::optional<FileIdentity> identity_;
   StoredRecordID lastRead_ = 0;
   bool isStopped_ = false;  // the running forEachItem()
+  bool hasGap_ = false;
 };
 
 }  // namespace halvox::platform::linux_
