@@ -73,6 +73,19 @@ std::string cutTo(std::string_view text, std::size_t width) {
   return std::string(text.substr(0, length)).append(kCut);
 }
 
+std::string cutToEnd(std::string_view text, std::size_t width) {
+  std::size_t excess = displayWidth(text);
+  if (excess <= width) return std::string(text);
+  if (width == 0) return {};
+  excess -= width - 1;  // and the mark
+  for (std::size_t removed = 0; removed < excess && !text.empty();) {
+    const auto step = nextUtf8(text);
+    removed += step.valid ? widthOf(step.character) : 1;
+    text.remove_prefix(step.length);
+  }
+  return std::string(kCut).append(text);
+}
+
 std::optional<std::size_t> terminalWidth(int descriptor) {
   // A terminal that does not know its size, such as a serial line, has that of old.
   constexpr std::size_t kUsual = 80;

@@ -17,6 +17,9 @@ namespace halvox::tools {
 // Returns the text if it fits, otherwise as much of its beginning as fits with a "…" after it.
 [[nodiscard]] std::string cutTo(std::string_view text, std::size_t width);
 
+// The same with the end of the text, after a "…".
+[[nodiscard]] std::string cutToEnd(std::string_view text, std::size_t width);
+
 // Returns the width of the terminal behind a descriptor; nothing if there is no terminal.
 [[nodiscard]] std::optional<std::size_t> terminalWidth(int descriptor);
 

@@ -50,6 +50,15 @@ TEST(TextTableTest, KeepsTheColumnsWithoutARankWhateverTheWidth) {
             "10  b\n");
 }
 
+TEST(TextTableTest, CutsTheBeginningOfATextIfItsEndMattersMore) {
+  EXPECT_EQ(cutToEnd("Playback.Start", 14), "Playback.Start");
+  EXPECT_EQ(cutToEnd("Playback.Start", 6), "…Start");
+  EXPECT_EQ(cutToEnd("音楽の時間", 6), "…時間");
+  EXPECT_EQ(cutToEnd("音楽の時間", 5), "…時間");
+  EXPECT_EQ(cutToEnd("abc", 1), "…");
+  EXPECT_EQ(cutToEnd("abc", 0), "");
+}
+
 TEST(TextTableTest, CountsTheColumnsThatCharactersTake) {
   EXPECT_EQ(displayWidth("abc"), 3U);
   EXPECT_EQ(displayWidth("é"), 1U);

@@ -195,6 +195,24 @@ double midnight(double now, int daysBefore) {
   return static_cast<double>(mktime(&fields));
 }
 
+std::string calendarTime(double seconds, std::tm* (*split)(const std::time_t*, std::tm*),
+                         const char* zone) {
+  const double whole = std::floor(seconds);
+  // Rounded down, because a time that was rounded up would lie after its record, and --since with
+  // this time would skip the record.
+  const auto milliseconds = static_cast<int>((seconds - whole) * 1000);
+  const auto time = static_cast<std::time_t>(whole);
+  std::tm fields{};
+  std::array<char, 64> date{};
+  if (split(&time, &fields) == nullptr ||
+      std::strftime(date.data(), date.size(), "%Y-%m-%d %H:%M:%S", &fields) == 0) {
+    return std::to_string(seconds);  // so far off that it has no date
+  }
+  std::array<char, 8> fraction{};
+  std::snprintf(fraction.data(), fraction.size(), ".%03d", milliseconds);
+  return std::string(date.data()) + fraction.data() + zone;
+}
+
 }  // namespace
 
 double timeNow() {
@@ -226,21 +244,8 @@ Result<double> parseTime(std::string_view text, double now) {
                    "@1795313222 (seconds since 1970)"};
 }
 
-std::string localTime(double seconds) {
-  const double whole = std::floor(seconds);
-  // Rounded down, because a time that was rounded up would lie after its record, and --since with
-  // this time would skip the record.
-  const auto milliseconds = static_cast<int>((seconds - whole) * 1000);
-  const auto time = static_cast<std::time_t>(whole);
-  std::tm fields{};
-  std::array<char, 64> date{};
-  if (localtime_r(&time, &fields) == nullptr ||
-      std::strftime(date.data(), date.size(), "%Y-%m-%d %H:%M:%S", &fields) == 0) {
-    return std::to_string(seconds);  // so far off that it has no date
-  }
-  std::array<char, 8> fraction{};
-  std::snprintf(fraction.data(), fraction.size(), ".%03d", milliseconds);
-  return std::string(date.data()) + fraction.data();
-}
+std::string localTime(double seconds) { return calendarTime(seconds, localtime_r, ""); }
+
+std::string utcClockTime(double seconds) { return calendarTime(seconds, gmtime_r, "Z"); }
 
 }  // namespace halvox::tools

@@ -27,5 +27,7 @@ std::optional<std::pair<double, double>> parseDay(std::string_view text, double 
 
 // Formats a time as local time, rounded down to milliseconds: "2026-11-21 22:44:05.123".
 std::string localTime(double seconds);
+// The same in UTC: "2026-11-21 21:44:05.123Z".
+std::string utcClockTime(double seconds);
 
 }  // namespace halvox::tools

@@ -98,6 +98,8 @@ TEST_F(TimeTextTest, TimesThatCommandsPrintAreTaken) {
   setZone("XXX-02");
   EXPECT_EQ(localTime(86'400.25), "1970-01-02 02:00:00.250");
   EXPECT_EQ(valueOf(parseTime(localTime(86'400.25), kNow)), 86'400.25);
+  EXPECT_EQ(utcClockTime(86'400.25), "1970-01-02 00:00:00.250Z");
+  EXPECT_EQ(valueOf(parseTime(utcClockTime(86'400.25), kNow)), 86'400.25);
   EXPECT_EQ(valueOf(parseTime("1970-01-02 01:00:00 +0100", kNow)), 86'400.0);  // summary
   EXPECT_EQ(valueOf(parseTime("1970-01-02T00:00:00Z", kNow)), 86'400.0);       // snapshots
   EXPECT_EQ(valueOf(parseTime("19700102T000000Z", kNow)), 86'400.0);           // names of files
