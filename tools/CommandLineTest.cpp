@@ -140,6 +140,37 @@ TEST(CommandLineTest, EventsAreChosenByApplicationCategoryTypeAndPattern) {
   EXPECT_EQ(events.selection.last, 4U);
 }
 
+TEST(CommandLineTest, EveryCommandForRowsTakesOrderCursorAndForm) {
+  for (const std::string command : {"metrics", "power", "link", "snapshots"}) {
+    const auto parsed =
+        parse({command, "-r", "--utc", "-l", "--no-pager", "--cursor", command + ":7@5.5"});
+    ASSERT_TRUE(std::holds_alternative<Command>(parsed)) << command;
+    const auto& rows = std::get<Command>(parsed).asked<ShowRecords>()->selection;
+    EXPECT_TRUE(rows.isReversed);
+    EXPECT_TRUE(rows.isUtc);
+    EXPECT_TRUE(rows.isFull);
+    EXPECT_FALSE(rows.usePager);
+    EXPECT_EQ(rows.cursor, (RowCursor{command, 7, 5.5}));
+  }
+  const auto parsed = parse(
+      {"events", "-f", "--all-names", "--own", "--after-cursor", "events:7@5", "--show-cursor"});
+  ASSERT_TRUE(std::holds_alternative<Command>(parsed));
+  const auto& events = *std::get<Command>(parsed).asked<ShowEvents>();
+  EXPECT_TRUE(events.hasAllNames);
+  EXPECT_TRUE(events.hasOwnEvents);
+  EXPECT_TRUE(events.selection.follow);
+  EXPECT_TRUE(events.selection.showCursor);
+  EXPECT_TRUE(events.selection.usePager);
+  EXPECT_EQ(events.selection.afterCursor, (RowCursor{"events", 7, 5}));
+}
+
+TEST(CommandLineTest, OptionsForRowsThatContradictEachOtherAreRefused) {
+  EXPECT_NE(errorOf({"events", "-r", "-f"}).find("--reverse"), std::string::npos);
+  EXPECT_NE(
+      errorOf({"link", "--cursor", "link:1@1", "--after-cursor", "link:1@1"}).find("--cursor"),
+      std::string::npos);
+}
+
 // The parsed form of a command that is not a request.
 template <typename T>
 T runOf(const Words& words) {

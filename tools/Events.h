@@ -7,14 +7,16 @@
 
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
+#include "tools/RowPrinter.h"
 #include "tools/StoreRun.h"
 
 namespace halvox::tools {
 
-// Formats one event on one line, without a line end: the local time, the name and the payload's
-// fields, or a JSON object with "time", "name" and "payload". Escapes characters of the payload
+// The columns of an event after its time: the name and the payload's fields. Escapes characters
 // that could control a terminal.
-std::string formatEvent(const platform::linux_::StoredEvent& event, OutputForm form);
+std::vector<RowCell> eventCells(const platform::linux_::StoredEvent& event);
+// A JSON object with "time", "name" and "payload" on one line.
+std::string eventJson(const platform::linux_::StoredEvent& event);
 
 // A request for stored events. An empty list stands for all.
 struct ShowEvents {
@@ -22,9 +24,13 @@ struct ShowEvents {
   std::vector<std::string> applications{};  // glob patterns
   std::vector<std::uint32_t> categories{};  // one without a domain stands for all domains
   std::vector<std::uint16_t> types{};
+  // JSON has everything. Text has by default only one of the two events of a message (EventRows),
+  // and no events about connections of halvoxctl itself, each of whose commands would add one.
+  bool hasAllNames = false;
+  bool hasOwnEvents = false;
 };
 
-// Prints the selected events, newest last. With --follow, continues with new events until the
+// Prints the selected events. With --follow, continues with new events until the
 // output is closed or the directory of the store is deleted. `outputDescriptor` is the descriptor
 // of `out`.
 ExitStatus showEvents(const ShowEvents& request, OutputForm form, std::ostream& out,

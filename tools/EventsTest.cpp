@@ -106,6 +106,87 @@ TEST_F(EventsTest, TheLastAreCountedAfterTheChoice) {
   EXPECT_EQ(shown({.names = {"com.a.*", "com.b.*"}, .last = 0}), "");
 }
 
+TEST_F(EventsTest, ShowsTheNewestFirstIfAskedFor) {
+  storeSome();
+
+  EXPECT_EQ(shown({.isReversed = true}), "4321");
+  EXPECT_EQ(shown({.last = 2, .isReversed = true}), "43");
+  EXPECT_EQ(shown({.names = {"com.a.*"}, .isReversed = true}), "31");
+}
+
+TEST_F(EventsTest, ShowsEachMessageOnceAndCountsMessages) {
+  for (std::int64_t number = 0; number < 3; ++number) {
+    store("com.tarno.halvox.Playback.Start", {{"n", number}});
+    store("com.tarno.music.Playback.Start", {{"n", number}});
+  }
+  const auto select = [this](ShowEvents request) {
+    request.selection.database = directory();
+    return shownBy(request);
+  };
+
+  EXPECT_EQ(select({}), "012");
+  EXPECT_EQ(select({.selection = {.last = 2}}), "12");
+  EXPECT_EQ(select({.selection = {.last = 2, .isReversed = true}}), "21");
+  EXPECT_EQ(select({.selection = {.last = 9}}), "012");
+  EXPECT_EQ(select({.hasAllNames = true}), "001122");
+  EXPECT_EQ(select({.selection = {.last = 3}, .hasAllNames = true}), "122");
+  EXPECT_EQ(select({.selection = {.names = {"com.tarno.halvox.*"}}}), "012");
+}
+
+TEST_F(EventsTest, ShowsEventsAboutOwnConnectionsOnlyIfAskedFor) {
+  const std::string uptime = "com.tarno.halvox.hvreportingclientuptime";
+  store(uptime, {{"n", 1}, {"processName", "player"}});
+  store(uptime, {{"n", 2}, {"processName", "halvoxctl"}});
+  const auto select = [this](ShowEvents request) {
+    request.selection.database = directory();
+    return shownBy(request);
+  };
+
+  EXPECT_EQ(select({}), "1");
+  EXPECT_EQ(select({.selection = {.last = 1}}), "1");
+  EXPECT_EQ(select({.hasOwnEvents = true}), "12");
+}
+
+// Each run continues after the cursor that the run before printed.
+TEST_F(EventsTest, ContinuesAfterACursor) {
+  storeSome();
+  ShowEvents request{.selection = {.last = 1, .showCursor = true}};
+  request.selection.names = {"com.b.*"};
+  request.selection.database = directory();
+  std::ostringstream out;
+  ASSERT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kDone);
+  const std::string text = out.str();
+  const auto line = text.find("-- cursor: ");
+  ASSERT_NE(line, std::string::npos) << text;
+  const auto cursor = parseCursor(text.substr(line + 11, text.find('\n', line) - line - 11));
+  ASSERT_TRUE(cursor) << cursor.error().message;
+
+  EXPECT_EQ(shown({.afterCursor = *cursor}), "34");
+  EXPECT_EQ(shown({.cursor = *cursor}), "234");
+  EXPECT_EQ(shown({.afterCursor = *cursor, .isReversed = true}), "1");
+  EXPECT_EQ(shown({.cursor = *cursor, .isReversed = true}), "21");
+  EXPECT_EQ(shown({.last = 1, .afterCursor = *cursor}), "4");
+  EXPECT_EQ(errors_.str(), "");
+}
+
+TEST_F(EventsTest, ACursorOfAnotherDatabaseCountsByItsTime) {
+  storeSome();
+
+  EXPECT_EQ(shown({.afterCursor = RowCursor{"events", 1'000'000, 101}}), "34");
+  EXPECT_EQ(shown({.cursor = RowCursor{"events", 1, 102}}), "34");
+  EXPECT_EQ(shown({.cursor = RowCursor{"events", 1, 101}, .isReversed = true}), "21");
+  EXPECT_NE(errors_.str().find("another database"), std::string::npos);
+}
+
+TEST_F(EventsTest, ACursorOfAnotherCommandIsRefused) {
+  RecordSelection request{.cursor = RowCursor{"link", 1, 100}, .database = directory()};
+  std::ostringstream out;
+
+  EXPECT_EQ(showEvents({.selection = request}, OutputForm::kText, out, -1, errors_),
+            ExitStatus::kBadArguments);
+  EXPECT_NE(errors_.str().find("begins with \"events:\""), std::string::npos);
+}
+
 TEST_F(EventsTest, JsonHasTimeNameAndPayload) {
   store("com.a.first", {{"n", 1}, {"text", "\x1B[2J"}});
   RecordSelection request;
@@ -194,22 +275,21 @@ TEST_F(EventsTest, FollowingShowsNewEventsUntilTheOutputIsClosed) {
   EXPECT_TRUE(client::eventually([&] { return status == 0; }));
 }
 
-TEST(FormatEventTest, TextIsOneLineWithLocalTimeNameAndFields) {
-  setenv("TZ", "UTC", 1);
-  tzset();
+TEST(EventCellsTest, AreTheNameAndTheFields) {
+  const auto cells = eventCells({1, 86'400.25, "com.tarno.test", R"({"a":1,"b":"x y"})"});
 
-  EXPECT_EQ(
-      formatEvent({1, 86'400.25, "com.tarno.test", R"({"a":1,"b":"x y"})"}, OutputForm::kText),
-      "1970-01-02 00:00:00.250  com.tarno.test  a=1 b=\"x y\"");
+  ASSERT_EQ(cells.size(), 2U);
+  EXPECT_EQ(cells[0].text, "com.tarno.test");
+  EXPECT_EQ(cells[1].text, "a=1 b=\"x y\"");
 }
 
-TEST(FormatEventTest, NothingThatAClientSentDrivesTheTerminal) {
+TEST(EventCellsTest, NothingThatAClientSentDrivesTheTerminal) {
   const StoredEvent event{1, 0, "evil\x1B[2J\xC2\x9B", "{\"k\":\"\xC2\x9B\x7F\"}"};
+  const auto cells = eventCells(event);
 
-  for (const auto form : {OutputForm::kText, OutputForm::kJson}) {
-    const std::string line = formatEvent(event, form);
-    EXPECT_EQ(line.find_first_of("\x1B\x7F\n"), std::string::npos);
-    EXPECT_EQ(line.find("\xC2\x9B"), std::string::npos);
+  for (const std::string& text : {cells[0].text, cells[1].text, eventJson(event)}) {
+    EXPECT_EQ(text.find_first_of("\x1B\x7F\n"), std::string::npos);
+    EXPECT_EQ(text.find("\xC2\x9B"), std::string::npos);
   }
 }
 

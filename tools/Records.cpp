@@ -14,7 +14,6 @@
 #include "tools/JsonText.h"
 #include "tools/LinkNames.h"
 #include "tools/StoreRun.h"
-#include "tools/TimeText.h"
 
 namespace halvox::tools {
 namespace {
@@ -95,65 +94,27 @@ std::string metricID(std::int64_t metric) {
   return text.data();
 }
 
-// Formats the time, the number or name that identifies the record, and its fields.
-std::string metricAsText(const StoredRecord& record) {
+std::vector<RowCell> metricCells(const StoredRecord& record) {
   const std::int64_t metric = record.number(store::kMetricID);
   const std::string& bytes = record.text(store::kMetricMessage);
   const auto fields = metric == kAudioIssueDetected ? audioIssueAsJson(bytes) : std::nullopt;
-  return metricID(metric) + "  " + (fields ? fieldsOfJson(*fields) : hexadecimal(bytes));
+  return {{.text = metricID(metric), .look = RowCell::Look::kName},
+          {.text = fields ? fieldsOfJson(*fields) : hexadecimal(bytes)}};
 }
 
-std::string asText(ShowRecords::Kind kind, const StoredRecord& record) {
-  switch (kind) {
-    case ShowRecords::Kind::kMetrics:
-      return metricAsText(record);
-    case ShowRecords::Kind::kPower:
-      return std::to_string(record.number(store::kPowerCategory)) + "  " +
-             harmlessText(record.text(store::kPowerEventName)) + "  " +
-             fieldsOfJson(record.text(store::kPowerPayload));
-    case ShowRecords::Kind::kLink:
-      return std::to_string(record.number(store::kLinkSessionID)) + "  " +
-             harmlessText(record.text(store::kLinkServiceName)) + "  " + linkCategoryName(record) +
-             "/" + linkTypeName(record) + "  " + fieldsOfJson(record.text(store::kLinkPayload));
-    case ShowRecords::Kind::kSnapshots:
-      return harmlessText(record.text(store::kSnapshotPath)) + "  " +
-             fieldsOfJson(record.text(store::kSnapshotSignature));
-  }
-  return {};
+std::vector<RowCell> linkCells(const StoredRecord& record) {
+  const std::string type = linkTypeName(record);
+  const bool isProblem = type == "Error" || type == "IssueDetector";
+  return {{.text = std::to_string(record.number(store::kLinkSessionID))},
+          {.text = harmlessText(record.text(store::kLinkServiceName))},
+          {.text = linkCategoryName(record) + "/" + type,
+           .look = isProblem ? RowCell::Look::kProblem : RowCell::Look::kName,
+           .keepsEnd = true},
+          {.text = fieldsOfJson(record.text(store::kLinkPayload))}};
 }
 
 // The columns in which the store guarantees complete JSON on one line.
 bool isJson(std::string_view column) { return column == "payload" || column == "signature"; }
-
-std::string asJson(ShowRecords::Kind kind, const StoredRecord& record) {
-  const auto columns = tableOf(kind).columns;
-  std::string json = "{\"time\":" + toJson(record.time);
-  for (std::size_t field = 0; field < columns.size(); ++field) {
-    json.append(",\"").append(columns[field].name).append("\":");
-    switch (columns[field].type) {
-      case store::ColumnType::kInteger:
-        json += std::to_string(record.number(field));
-        break;
-      case store::ColumnType::kText:
-        json += harmlessJson(isJson(columns[field].name) ? record.text(field)
-                                                         : tools::quoted(record.text(field)));
-        break;
-      case store::ColumnType::kBytes:
-        json += tools::quoted(hexadecimal(record.text(field)));
-        break;
-    }
-  }
-  const bool isIssue =
-      kind == ShowRecords::Kind::kMetrics && record.number(store::kMetricID) == kAudioIssueDetected;
-  const auto fields = isIssue ? audioIssueAsJson(record.text(store::kMetricMessage)) : std::nullopt;
-  // The bytes stay in the object: they are what was recorded, the fields are our reading of them.
-  if (fields) json += ",\"fields\":" + harmlessJson(*fields);
-  if (kind == ShowRecords::Kind::kLink) {
-    json += ",\"category_name\":" + tools::quoted(linkCategoryName(record)) +
-            ",\"type_name\":" + tools::quoted(linkTypeName(record));
-  }
-  return json + "}";
-}
 
 RecordFilter filterOf(const ShowRecords& request) {
   RecordFilter filter = filterOf(request.selection);
@@ -194,26 +155,90 @@ RecordFilter filterOf(const ShowRecords& request) {
   return filter;
 }
 
+class RecordReading final : public StoreReading {
+ public:
+  explicit RecordReading(ShowRecords::Kind kind) : kind_(kind), table_(tableOf(kind)) {}
+
+  Outcome find(StoreReader& reader, const RecordFilter& filter,
+               const RowCallback& callback) override {
+    return reader.forEachRecord(
+        table_, filter, [&](const StoredRecord& record) { callback(record.id, record.time); });
+  }
+  Outcome printAll(StoreReader& reader, const RecordFilter& filter, RowPrinter& printer) override {
+    return reader.forEachRecord(table_, filter,
+                                [&](const StoredRecord& record) { print(record, printer); });
+  }
+  Outcome printAdded(EventFollower& follower, RowPrinter& printer) override {
+    return follower.deliver(table_, [&](const StoredRecord& record) { print(record, printer); });
+  }
+
+ private:
+  void print(const StoredRecord& record, RowPrinter& printer) const {
+    printer.print(
+        record.id, record.time, [&] { return recordCells(kind_, record); },
+        [&] { return recordJson(kind_, record); });
+  }
+
+  ShowRecords::Kind kind_;
+  const RecordTable& table_;
+};
+
 }  // namespace
 
-std::string formatRecord(ShowRecords::Kind kind, const StoredRecord& record, OutputForm form) {
-  return form == OutputForm::kJson ? asJson(kind, record)
-                                   : localTime(record.time) + "  " + asText(kind, record);
+std::vector<RowCell> recordCells(ShowRecords::Kind kind, const StoredRecord& record) {
+  switch (kind) {
+    case ShowRecords::Kind::kMetrics:
+      return metricCells(record);
+    case ShowRecords::Kind::kPower:
+      return {
+          {.text = std::to_string(record.number(store::kPowerCategory))},
+          {.text = harmlessText(record.text(store::kPowerEventName)), .look = RowCell::Look::kName},
+          {.text = fieldsOfJson(record.text(store::kPowerPayload))}};
+    case ShowRecords::Kind::kLink:
+      return linkCells(record);
+    case ShowRecords::Kind::kSnapshots:
+      return {{.text = harmlessText(record.text(store::kSnapshotPath)), .keepsEnd = true},
+              {.text = fieldsOfJson(record.text(store::kSnapshotSignature))}};
+  }
+  return {};
+}
+
+std::string recordJson(ShowRecords::Kind kind, const StoredRecord& record) {
+  const auto columns = tableOf(kind).columns;
+  std::string json = "{\"time\":" + toJson(record.time);
+  for (std::size_t field = 0; field < columns.size(); ++field) {
+    json.append(",\"").append(columns[field].name).append("\":");
+    switch (columns[field].type) {
+      case store::ColumnType::kInteger:
+        json += std::to_string(record.number(field));
+        break;
+      case store::ColumnType::kText:
+        json += harmlessJson(isJson(columns[field].name) ? record.text(field)
+                                                         : tools::quoted(record.text(field)));
+        break;
+      case store::ColumnType::kBytes:
+        json += tools::quoted(hexadecimal(record.text(field)));
+        break;
+    }
+  }
+  const bool isIssue =
+      kind == ShowRecords::Kind::kMetrics && record.number(store::kMetricID) == kAudioIssueDetected;
+  const auto fields = isIssue ? audioIssueAsJson(record.text(store::kMetricMessage)) : std::nullopt;
+  // The bytes stay in the object: they are what was recorded, the fields are our reading of them.
+  if (fields) json += ",\"fields\":" + harmlessJson(*fields);
+  if (kind == ShowRecords::Kind::kLink) {
+    json += ",\"category_name\":" + tools::quoted(linkCategoryName(record)) +
+            ",\"type_name\":" + tools::quoted(linkTypeName(record));
+  }
+  return json + "}";
 }
 
 ExitStatus showRecords(const ShowRecords& request, OutputForm form, std::ostream& out,
                        int outputDescriptor, std::ostream& errors) {
-  const RecordTable& table = tableOf(request.kind);
-  const auto print = [&](const StoredRecord& record) {
-    out << formatRecord(request.kind, record, form) << '\n';
-  };
+  RecordReading reading(request.kind);
   return runOverStore(
       {commandOf(request.kind), form, request.selection, out, outputDescriptor, errors},
-      filterOf(request),
-      {[&](StoreReader& reader, const RecordFilter& filter) {
-         return reader.forEachRecord(table, filter, print);
-       },
-       [&](EventFollower& follower) { return follower.deliver(table, print); }});
+      filterOf(request), reading);
 }
 
 }  // namespace halvox::tools

@@ -7,6 +7,7 @@
 
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
+#include "tools/RowPrinter.h"
 #include "tools/StoreRun.h"
 
 namespace halvox::tools {
@@ -24,11 +25,12 @@ struct ShowRecords {
   std::vector<std::int64_t> types{};
 };
 
-// Formats one record on one line, without a line end: the local time and the columns, or a JSON
-// object with the columns' names. Shows the fields of a metric that it knows, and the bytes of any
-// other metric as hexadecimal text. Escapes characters that could control a terminal.
-std::string formatRecord(ShowRecords::Kind kind, const platform::linux_::StoredRecord& record,
-                         OutputForm form);
+// The columns of a record after its time. Shows the fields of a metric that it knows, and the bytes
+// of any other metric as hexadecimal text. Escapes characters that could control a terminal.
+std::vector<RowCell> recordCells(ShowRecords::Kind kind,
+                                 const platform::linux_::StoredRecord& record);
+// A JSON object with the time and the columns' names on one line.
+std::string recordJson(ShowRecords::Kind kind, const platform::linux_::StoredRecord& record);
 
 // Prints the selected records, as showEvents() does.
 ExitStatus showRecords(const ShowRecords& request, OutputForm form, std::ostream& out,

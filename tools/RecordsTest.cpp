@@ -93,9 +93,11 @@ TEST_F(RecordsTest, IssueMetricsAreShownByTheirFields) {
   EXPECT_EQ(shown(Kind::kMetrics),
             "1970-01-01 00:01:40.000  0x5B0003  issue_type=xrun node=\"the node\" "
             "rtaid_client=player duration=-5 timestamp=70\n");
-  EXPECT_THAT(shown(Kind::kMetrics, OutputForm::kJson),
-              HasSubstr(R"("fields":{"issue_type":"xrun","node":"the node",)"
-                        R"("rtaid_client":"player","duration":-5,"timestamp":70}})"));
+  EXPECT_THAT(
+      shown(Kind::kMetrics, OutputForm::kJson),
+      HasSubstr(
+          R"("fields":{"issue_type":"xrun","node":"the node",)"
+          R"("rtaid_client":"player","duration":-5,"timestamp":70},"cursor":"metrics:1@100"})"));
 }
 
 TEST_F(RecordsTest, OtherMetricsAreShownByTheirBytes) {
@@ -111,8 +113,9 @@ TEST_F(RecordsTest, BytesThatAreNotAnIssueMetricAreShownUnchanged) {
       {.time = 100, .metricID = kIssueMetric, .message = {std::byte{0x1A}, std::byte{0x05}}});
 
   EXPECT_EQ(shown(Kind::kMetrics), "1970-01-01 00:01:40.000  0x5B0003  1a05\n");
-  EXPECT_EQ(shown(Kind::kMetrics, OutputForm::kJson),
-            "{\"time\":100.0,\"metric_id\":5963779,\"message\":\"1a05\"}\n");
+  EXPECT_EQ(
+      shown(Kind::kMetrics, OutputForm::kJson),
+      "{\"time\":100.0,\"metric_id\":5963779,\"message\":\"1a05\",\"cursor\":\"metrics:1@100\"}\n");
 }
 
 TEST_F(RecordsTest, PowerEventsAreShownWithCategoryNameAndPayload) {
@@ -121,17 +124,19 @@ TEST_F(RecordsTest, PowerEventsAreShownWithCategoryNameAndPayload) {
 
   EXPECT_EQ(shown(Kind::kPower), "1970-01-01 00:01:40.000  28  Oxbow  a=1\n");
   EXPECT_EQ(shown(Kind::kPower, OutputForm::kJson),
-            "{\"time\":100.0,\"category_id\":28,\"event_name\":\"Oxbow\",\"payload\":{\"a\":1}}\n");
+            "{\"time\":100.0,\"category_id\":28,\"event_name\":\"Oxbow\",\"payload\":{\"a\":1},"
+            "\"cursor\":\"power:1@100\"}\n");
 }
 
 TEST_F(RecordsTest, LinkMessagesAreShownWithTheirParty) {
   storeLink(100, -1, 3, 9);
 
   EXPECT_EQ(shown(Kind::kLink), "1970-01-01 00:01:40.000  -1  music  Input/AudioUnitUsage  a=1\n");
-  EXPECT_EQ(shown(Kind::kLink, OutputForm::kJson),
-            "{\"time\":100.0,\"session_id\":-1,\"client_name\":\"client\",\"service_name\":"
-            "\"music\",\"category\":3,\"type\":9,\"payload\":{\"a\":1},"
-            "\"category_name\":\"Input\",\"type_name\":\"AudioUnitUsage\"}\n");
+  EXPECT_EQ(
+      shown(Kind::kLink, OutputForm::kJson),
+      "{\"time\":100.0,\"session_id\":-1,\"client_name\":\"client\",\"service_name\":"
+      "\"music\",\"category\":3,\"type\":9,\"payload\":{\"a\":1},"
+      "\"category_name\":\"Input\",\"type_name\":\"AudioUnitUsage\",\"cursor\":\"link:1@100\"}\n");
 }
 
 TEST_F(RecordsTest, SnapshotsAreShownWithPathAndSignature) {
@@ -139,7 +144,8 @@ TEST_F(RecordsTest, SnapshotsAreShownWithPathAndSignature) {
 
   EXPECT_EQ(shown(Kind::kSnapshots), "1970-01-01 00:01:40.000  /s/1.zst  Type=haptics\n");
   EXPECT_EQ(shown(Kind::kSnapshots, OutputForm::kJson),
-            "{\"time\":100.0,\"signature\":{\"Type\":\"haptics\"},\"path\":\"/s/1.zst\"}\n");
+            "{\"time\":100.0,\"signature\":{\"Type\":\"haptics\"},\"path\":\"/s/"
+            "1.zst\",\"cursor\":\"snapshots:1@100\"}\n");
 }
 
 TEST_F(RecordsTest, LinkMessagesAreChosenByTheirNumbersTogether) {

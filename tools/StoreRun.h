@@ -13,6 +13,8 @@
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
 #include "tools/Complaint.h"
+#include "tools/RowCursor.h"
+#include "tools/RowPrinter.h"
 #include "tools/TextPattern.h"
 
 namespace halvox::tools {
@@ -24,26 +26,53 @@ struct RecordSelection {
   std::optional<double> since{};      // seconds since 1970
   std::optional<double> until{};
   std::optional<std::uint64_t> last{};
+  // Begin with this row, or after it, in the order of showing. At most one of the two is set.
+  std::optional<RowCursor> cursor{};
+  std::optional<RowCursor> afterCursor{};
+  bool isReversed = false;  // newest first
   bool follow = false;
-  std::string database{};  // empty: as the service's configuration says
+  bool isUtc = false;       // the times; otherwise local
+  bool isFull = false;      // cut no text at a terminal
+  bool showCursor = false;  // after the last row
+  bool usePager = true;     // at a terminal
+  std::string database{};   // empty: as the service's configuration says
 };
 
 // The arguments of runOverStore() that all kinds of records share.
 struct StoreRun {
-  std::string command;  // for error messages
-  OutputForm form;      // of error messages
+  std::string command;  // for error messages and cursors
+  OutputForm form;
   const RecordSelection& selection;
   std::ostream& out;
   int outputDescriptor;  // the descriptor of `out`
   std::ostream& errors;
 };
 
-// How records are read and printed: `all` handles those that the store has, `added` those that were
-// added since.
-struct StoreReading {
+// How the records of one kind are read and printed. Belongs to one thread.
+class StoreReading {
+ public:
   using Outcome = platform::linux_::Result<void, platform::linux_::StoreError>;
-  std::function<Outcome(platform::linux_::StoreReader&, const platform::linux_::RecordFilter&)> all;
-  std::function<Outcome(platform::linux_::EventFollower&)> added;
+  using RowCallback = std::function<void(platform::linux_::StoredRecordID id, double time)>;
+
+  StoreReading() = default;
+  StoreReading(const StoreReading&) = delete;
+  StoreReading& operator=(const StoreReading&) = delete;
+  virtual ~StoreReading() = default;
+
+  // Gives the number and the time of each record.
+  virtual Outcome find(platform::linux_::StoreReader& reader,
+                       const platform::linux_::RecordFilter& filter,
+                       const RowCallback& callback) = 0;
+  // Called once, before the first record is printed, with the row after which --after-cursor
+  // begins. May change the filter.
+  virtual Outcome prepare(platform::linux_::StoreReader& /*reader*/,
+                          std::optional<platform::linux_::StoredRecordID> shownBefore,
+                          platform::linux_::RecordFilter& filter);
+  // Prints the records that the store has.
+  virtual Outcome printAll(platform::linux_::StoreReader& reader,
+                           const platform::linux_::RecordFilter& filter, RowPrinter& printer) = 0;
+  // Prints those that were added since the last call.
+  virtual Outcome printAdded(platform::linux_::EventFollower& follower, RowPrinter& printer) = 0;
 };
 
 // Converts a selection to the filter of the store's reader.
@@ -54,9 +83,10 @@ platform::linux_::RecordFilter filterOf(const RecordSelection& selection);
 std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string& database,
                                                                const Complaint& complain);
 
-// Opens the selected store and reads it once or, with --follow, until the output is closed or the
-// directory of the store is deleted.
-ExitStatus runOverStore(const StoreRun& run, const platform::linux_::RecordFilter& filter,
-                        const StoreReading& reading);
+// Opens the selected store and prints its records once or, with --follow, until the output is
+// closed or the directory of the store is deleted. At a terminal, prints into a pager unless it
+// follows.
+ExitStatus runOverStore(const StoreRun& run, platform::linux_::RecordFilter filter,
+                        StoreReading& reading);
 
 }  // namespace halvox::tools

@@ -67,6 +67,11 @@ void addEvents(CommandSet& commands) {
       commands.add({.name = "events",
                     .summary = "Show the events that the service stored, newest last",
                     .example = "halvoxctl events --name 'com.tarno.*' --since 5m --follow",
+                    .details = "The service stores each message under two names, one with "
+                               "\"halvox\" and one with the service type. Lines show the second; "
+                               "--all-names shows both. Lines leave out what the service recorded "
+                               "about connections of halvoxctl itself; --own shows it. --json has "
+                               "everything.",
                     .reach = CommandReach::kFiles});
   events
       .add_option("--app", request->applications,
@@ -77,6 +82,9 @@ void addEvents(CommandSet& commands) {
       ->take_all();
   addCategories(events, request->categories, "events");
   addTypes(events, request->types, "events");
+  events.add_flag("--all-names", request->hasAllNames, "Show both events of each message");
+  events.add_flag("--own", request->hasOwnEvents,
+                  "Also show events about connections of halvoxctl itself");
   addSelection(events, request->selection, "events", "--name");
   commands.onRun(
       events, [request] { return *request; }, runEvents);

@@ -14,6 +14,18 @@ platform::linux_::Result<double> parseTimeNow(std::string_view text) {
   return parseTime(text, timeNow());
 }
 
+void addCursors(CLI::App& app, RecordSelection& selection, const std::string& records) {
+  auto* at = addParsed(app, "--cursor", selection.cursor, parseCursor,
+                       "Begin with the row that this cursor names; cursors are in the JSON output")
+                 ->type_name("CURSOR");
+  addParsed(app, "--after-cursor", selection.afterCursor, parseCursor,
+            "Only " + records + " that come after the row that this cursor names")
+      ->type_name("CURSOR")
+      ->excludes(at);
+  app.add_flag("--show-cursor", selection.showCursor,
+               "Print the cursor of the last row after it, for --after-cursor of the next run");
+}
+
 }  // namespace
 
 void addTimes(CLI::App& app, std::optional<double>& since, std::optional<double>& until,
@@ -57,9 +69,20 @@ void addSelection(CLI::App& app, RecordSelection& selection, const char* records
                 " with a text that matches this extended regular expression; ignores case unless "
                 "the expression has an upper-case letter")
       ->type_name("REGEX");
-  app.add_flag("--follow", selection.follow,
+  auto* reverse = app.add_flag("-r,--reverse", selection.isReversed, "Newest first");
+  app.add_flag("-f,--follow", selection.follow,
                std::string("Keep showing ") + records +
-                   " as they come; starts with the last 10 unless --since or --last is given");
+                   " as they come; starts with the last 10 unless --since, --last or a cursor is "
+                   "given")
+      ->excludes(reverse);
+  addCursors(app, selection, records);
+  app.add_flag("--utc", selection.isUtc, "Show times in UTC instead of local time");
+  app.add_flag("-l,--full", selection.isFull,
+               "Show long values whole; at a terminal they are otherwise cut to its width");
+  app.add_flag_callback(
+      "--no-pager", [&selection] { selection.usePager = false; },
+      "Print directly; at a terminal, what does not follow is otherwise shown by "
+      "$HALVOX_PAGER, $PAGER or less");
   addDatabase(app, selection.database);
 }
 

@@ -15,9 +15,9 @@ void addTimes(CLI::App& app, std::optional<double>& since, std::optional<double>
               const char* records);
 // Adds --database.
 void addDatabase(CLI::App& app, std::string& database);
-// Adds the options that all commands for stored records share: --since, --until, --last, --follow
-// and --database. If `names` is not null, it is the name of an option for the names of the records.
-// `records` is the word for the records in the help. The options are parsed into `selection`.
+// Adds the options that all commands for stored records share, from --since to --database. If
+// `names` is not null, it is the name of an option for the names of the records. `records` is the
+// word for the records in the help. The options are parsed into `selection`.
 void addSelection(CLI::App& app, RecordSelection& selection, const char* records,
                   const char* names);
 
