@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "analysis/MessageJoin.h"
 #include "analysis/MessageNames.h"
 #include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>
@@ -26,6 +27,13 @@ std::string_view beginningOf(std::string_view text, std::size_t bytes) {
     if (length + step > bytes) return text.substr(0, length);
     length += step;
   }
+}
+
+// The summary of a session has all keys of its messages, with all values in one text. Only its own
+// key says something new.
+bool isSummary(const Record& record) {
+  return record.kind == RecordKind::kLinkMessage && record.category == "Undefined" &&
+         record.type == "Unknown" && record.payload->text(kSummaryKey).has_value();
 }
 
 FieldType typeOfNumber(std::string_view text) {
@@ -62,6 +70,7 @@ class FieldCollector::Values
         record_(record),
         place_(place),
         json_(record.payload->json()),
+        isSummary_(isSummary(record)),
         stream_(json_.data(), json_.size()) {}
 
   void read() {
@@ -100,7 +109,8 @@ class FieldCollector::Values
     return true;
   }
   bool add(FieldType type, std::string_view text) {
-    if (depth_ == 1) collector_.addValue(record_, place_, key_, type, text);
+    if (depth_ != 1 || (isSummary_ && key_ != kSummaryKey)) return true;
+    collector_.addValue(record_, place_, key_, type, text);
     return true;
   }
 
@@ -108,6 +118,7 @@ class FieldCollector::Values
   const Record& record_;
   std::size_t place_;
   std::string_view json_;  // of the record
+  bool isSummary_;
   rapidjson::MemoryStream stream_;
   std::string key_;
   int depth_ = 0;

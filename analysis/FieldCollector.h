@@ -50,7 +50,8 @@ struct Field {
 };
 
 // Collects the keys of stored records, in one pass. Issue metrics have numbered fields instead of
-// keys and are skipped, as are keys inside of values.
+// keys and are skipped, as are keys inside of values, and the keys that the summary of a session
+// repeats.
 //
 // Clients choose keys, so everything is bounded: the first kMostKeys keys are kept, of each the
 // first kMostPlaces places and kMostExampleBytes of an example. What exceeds the bounds is counted.

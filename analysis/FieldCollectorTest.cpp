@@ -138,6 +138,20 @@ TEST_F(FieldCollectorTest, PlacesThatAreTooManyAreCounted) {
   EXPECT_EQ(field("n").otherPlaces, 3U);
 }
 
+TEST_F(FieldCollectorTest, ASummaryCountsWithItsOwnKeyOnly) {
+  Record summary = record(RecordKind::kLinkMessage,
+                          R"({"HV_Session_Summary_Event":"7","n":"1,2","audiotag":"x"})");
+  summary.category = "Undefined";
+  summary.type = "Unknown";
+  collector_.add(summary);
+  collector_.add(record(RecordKind::kLinkMessage, R"({"n":1})"));
+
+  EXPECT_EQ(field("HV_Session_Summary_Event").linkMessages, 1U);
+  EXPECT_EQ(countOf(field("n"), FieldType::kInteger), 1U);
+  EXPECT_EQ(countOf(field("n"), FieldType::kText), 0U);
+  EXPECT_EQ(fields_.size(), 2U);
+}
+
 TEST_F(FieldCollectorTest, WhatIsNotAnObjectHasNoKeys) {
   for (const char* json : {"", "7", "\"t\"", "[1]", "{", "null"}) {
     addOther(RecordKind::kPowerEvent, "event", json);

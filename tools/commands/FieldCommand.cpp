@@ -37,7 +37,8 @@ void addFieldCommand(CommandSet& commands) {
        .details = "One line for each key: the types of its values, the number of records that have "
                   "it, its newest value, and the messages and events in which it occurs. The two "
                   "events of a message count as one record. Issue metrics have no keys and are "
-                  "skipped. At most 10000 keys are shown. At a terminal, values are cut and "
+                  "skipped, as are the keys that the summary of a session repeats. At most 10000 "
+                  "keys are shown. At a terminal, values are cut and "
                   "columns are omitted to fit its width; --json has everything.",
        .reach = CommandReach::kFiles});
   addFilters(fields, *request);
