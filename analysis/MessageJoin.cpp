@@ -58,6 +58,7 @@ void MessageJoin::addEvent(const Record& record) {
     // This event is not a message, but keeps its place among the messages.
     Waiting& event = push(record, 0);
     event.message.name = record.name;
+    event.message.commonID = record.id;
     event.isComplete = true;
     return;
   }
@@ -76,6 +77,7 @@ void MessageJoin::addEvent(const Record& record) {
   }
   message->message.application = record.application;
   message->hasCommon = isCommon;
+  (isCommon ? message->message.commonID : message->message.serviceID) = record.id;
   if (!isCommon) message->message.service = record.service;
 }
 
@@ -90,6 +92,7 @@ bool MessageJoin::completesTwin(const Record& record) {
     return false;
   }
   last->message.service = record.service;
+  last->message.serviceID = record.id;
   last->isComplete = last->message.isLinkMessage || last->key == 0;
   return true;
 }
@@ -107,6 +110,7 @@ void MessageJoin::addLinkMessage(const Record& record) {
     message->isComplete = !message->message.service.empty();
   }
   message->message.isLinkMessage = true;
+  message->message.linkID = record.id;
   message->message.sessionID = record.sessionID;
   if (message->message.service.empty()) message->message.service = record.service;
 }
@@ -115,6 +119,7 @@ void MessageJoin::addSummary(const Record& record) {
   Waiting& summary = push(record, 0);
   summary.isComplete = true;
   summary.message.isLinkMessage = true;
+  summary.message.linkID = record.id;
   summary.message.sessionID = record.sessionID;
   summary.message.service = record.service;
   if (record.sessionID) {

@@ -30,6 +30,10 @@ struct Message {
   std::string payload;                    // JSON
   bool isEvent = false;                   // it was recorded as an event
   bool isLinkMessage = false;             // it went through the link
+  // The IDs of its records; 0 if it has no such record.
+  std::int64_t commonID = 0;   // the event under the name that all services share
+  std::int64_t serviceID = 0;  // the event under the name of its service type
+  std::int64_t linkID = 0;
 };
 
 // Makes one message of its records: up to two events, whose names differ and whose payloads are

@@ -13,6 +13,7 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
+using ::testing::UnorderedElementsAre;
 
 class MessageJoinTest : public testing::Test {
  protected:
@@ -32,6 +33,21 @@ TEST_F(MessageJoinTest, AMessageHasTheIDOfItsEventEvenIfTheLinkRecordedItFirst) 
   join.finish();
 
   EXPECT_THAT(delivered, ElementsAre(2));
+}
+
+TEST_F(MessageJoinTest, AMessageKnowsItsRecords) {
+  std::vector<std::int64_t> ids;
+  MessageJoin joining([&](const Message& message) {
+    ids.insert(ids.end(), {message.commonID, message.serviceID, message.linkID});
+  });
+  records.message({}, "Session_Playback", "Start");                        // 1 to 3
+  records.event({.sessionID = std::nullopt}, "Session_Playback", "Stop");  // 4 and 5
+  records.summary({});                                                     // 6
+  records.clientGone("player");                                            // 7
+  EXPECT_TRUE(records.forEach({}, [&](const Record& record) { joining.add(record); }));
+  joining.finish();
+
+  EXPECT_THAT(ids, UnorderedElementsAre(1, 2, 3, 4, 5, 0, 0, 0, 6, 7, 0, 0));
 }
 
 TEST_F(MessageJoinTest, AMessageThatOnlyTheLinkRecordedHasTheIDOfThatRecord) {
