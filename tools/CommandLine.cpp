@@ -39,6 +39,7 @@ constexpr CommandGroup kGroups[] = {
     {"What the service stored", addSnapshotCommands, GroupPlace::kArguments},
     {"What the service stored", addSummaryCommand, GroupPlace::kArguments},
     {"What the service stored", addReportCommand, GroupPlace::kArguments},
+    {"What the service stored", addExplainCommand, GroupPlace::kArguments},
     {"What the service stored", addFieldCommand, GroupPlace::kArguments},
     {"What the service stored", addQueryCommands, GroupPlace::kArguments},
     {"What the service stored", addExportCommand, GroupPlace::kArguments},

@@ -11,6 +11,7 @@
 
 #include "tools/Drivers.h"
 #include "tools/Events.h"
+#include "tools/Explain.h"
 #include "tools/Export.h"
 #include "tools/Fields.h"
 #include "tools/Notify.h"
@@ -380,6 +381,17 @@ TEST(CommandLineTest, SqlTakesAQueryOrReadsTheInput) {
   EXPECT_EQ(asked({"sql", "SELECT 1", "--database", "/d"}).query, "SELECT 1");
   EXPECT_EQ(asked({"sql", "SELECT 1", "--database", "/d"}).database, "/d");
   EXPECT_EQ(asked({"sql"}).query, "");
+}
+
+TEST(CommandLineTest, ExplainTakesATargetAndTimes) {
+  const auto asked =
+      runOf<Explain>({"explain", "-1", "--since", "@5", "--until", "@9.5", "--database", "/d"});
+
+  EXPECT_EQ(asked.target, "-1");
+  EXPECT_EQ(asked.since, 5.0);
+  EXPECT_EQ(asked.until, 9.5);
+  EXPECT_EQ(asked.database, "/d");
+  EXPECT_EQ(errorOf({"explain"}), "halvoxctl explain: TARGET is required");
 }
 
 TEST(CommandLineTest, FieldsAreChosenByApplicationCategoryTypeAndTime) {

@@ -10,6 +10,7 @@ void addRequestCommands(CommandSet& commands);   // create, send, list…: one r
 void addScriptRequests(CommandSet& commands);    // wait, sleep: only in scripts
 void addScriptCommands(CommandSet& commands);    // run, shell
 void addRecordCommands(CommandSet& commands);    // events, metrics, power, link
+void addExplainCommand(CommandSet& commands);    // explain
 void addFieldCommand(CommandSet& commands);      // fields
 void addQueryCommands(CommandSet& commands);     // sql
 void addExportCommand(CommandSet& commands);     // export
