@@ -290,7 +290,7 @@ std::string describeMoment(const StreamStory& story, const StreamMoment& moment)
   return {};
 }
 
-std::string streamJson(const StreamStory& story) {
+std::string streamJson(const StreamStory& story, std::optional<std::size_t> momentsNotShown) {
   const auto optional = [](const std::optional<std::int64_t>& value) {
     return value ? std::to_string(*value) : std::string("null");
   };
@@ -311,7 +311,9 @@ std::string streamJson(const StreamStory& story) {
   json += ",\"formats\":" + changesJson(story.formats, "format", nullptr);
   json += ",\"routes\":" + changesJson(story.routes, "devices", "device_node_names");
   json += ",\"xruns\":" + xrunsJson(story.xruns);
-  json += ",\"messages\":" + std::to_string(story.messages) + "}";
+  json += ",\"messages\":" + std::to_string(story.messages);
+  if (momentsNotShown) json += ",\"moments_not_shown\":" + std::to_string(*momentsNotShown);
+  json += "}";
   return harmlessJson(json);
 }
 

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstddef>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -22,7 +24,9 @@ namespace halvox::tools {
                                          const analysis::StreamMoment& moment);
 
 // JSON objects on one line, without a line end. A stream that still runs has no "ended".
-[[nodiscard]] std::string streamJson(const analysis::StreamStory& story);
+// With `momentsNotShown`, the stream has this number as "moments_not_shown".
+[[nodiscard]] std::string streamJson(const analysis::StreamStory& story,
+                                     std::optional<std::size_t> momentsNotShown = std::nullopt);
 [[nodiscard]] std::string momentJson(const analysis::StreamMoment& moment);
 
 // "4.6s", "12m34s", "1h02m03s".

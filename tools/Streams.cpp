@@ -27,9 +27,6 @@ using analysis::StreamMoment;
 using analysis::StreamStory;
 using platform::linux_::StoreReader;
 
-// What is read at once for `show`. A stream with more moments is shown without the rest.
-constexpr std::size_t kMostMoments = 10'000;
-
 bool matches(const std::vector<std::string>& patterns, const std::string& text) {
   return std::ranges::any_of(patterns, [&](const std::string& pattern) {
     return ::fnmatch(pattern.c_str(), text.c_str(), 0) == 0;
@@ -136,7 +133,7 @@ ExitStatus showStream(const ShowStream& request, OutputForm form, std::ostream& 
     if (!isWanted(story)) return;
     auto& [moments, notKept] = open[story.id];
     // The end always fits.
-    if (moments.size() < kMostMoments || moment.kind == StreamMoment::Kind::kEnded) {
+    if (moments.size() < request.mostMoments || moment.kind == StreamMoment::Kind::kEnded) {
       moments.push_back(moment);
     } else {
       ++notKept;
@@ -153,7 +150,7 @@ ExitStatus showStream(const ShowStream& request, OutputForm form, std::ostream& 
       return;
     }
     isFound = true;
-    out << streamJson(story) << '\n';
+    out << streamJson(story, moments.empty() ? 0 : moments.mapped().second) << '\n';
     if (moments.empty()) return;
     for (const StreamMoment& moment : moments.mapped().first) out << momentJson(moment) << '\n';
   };

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <ostream>
@@ -25,6 +26,8 @@ struct ShowStreams {
 struct ShowStream {
   std::int64_t id = 0;  // as the list shows it, or the session's
   std::string database{};
+  // All moments of a stream are in memory at once. Further ones are counted.
+  std::size_t mostMoments = 10'000;
 };
 
 // Prints a table of streams, newest last, or a JSON object on each line. A stream is selected by

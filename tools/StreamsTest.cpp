@@ -1,5 +1,7 @@
 #include "tools/Streams.h"
 
+#include <algorithm>
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -77,6 +79,31 @@ TEST_F(StreamsTest, ShowsTheMomentsOfOneStream) {
             ExitStatus::kDone);
   EXPECT_THAT(out_.str(), HasSubstr("It starts.\n"));
   EXPECT_THAT(out_.str(), HasSubstr("It stops.\n"));
+}
+
+TEST_F(StreamsTest, SaysHowManyMomentsAreNotShown) {
+  storeRun("player", true);
+  EXPECT_EQ(list({}, OutputForm::kJson), ExitStatus::kDone);
+  EXPECT_EQ(out_.str().find("moments_not_shown"), std::string::npos);
+  const std::int64_t id = std::stoll(out_.str().substr(out_.str().find(':') + 1));
+  const auto show = [&](OutputForm form, std::size_t most) {
+    out_.str("");
+    EXPECT_EQ(
+        showStream({.id = id, .database = directory(), .mostMoments = most}, form, out_, errors_),
+        ExitStatus::kDone);
+    return out_.str();
+  };
+
+  const std::string all = show(OutputForm::kJson, 100);
+  EXPECT_THAT(all, HasSubstr("\"moments_not_shown\":0}"));
+  const auto moments = std::ranges::count(all, '\n') - 1;
+  ASSERT_GT(moments, 2);
+  // The first one and the end.
+  const std::string some = show(OutputForm::kJson, 1);
+  EXPECT_EQ(std::ranges::count(some, '\n'), 1 + 2);
+  EXPECT_THAT(some, HasSubstr("\"moments_not_shown\":" + std::to_string(moments - 2) + "}"));
+  EXPECT_THAT(show(OutputForm::kText, 1),
+              HasSubstr(std::to_string(moments - 2) + " further moments are not shown.\n"));
 }
 
 TEST_F(StreamsTest, AnUnknownStreamIsAnError) {
