@@ -185,9 +185,8 @@ std::vector<std::string> unknownSentences(const ExplainSettings& settings) {
       "start, "
       "and may have stored these records with others.",
       "A message that was refused, or that found no session, leaves no record. The service counts "
-      "what "
-      "it refuses, drops and suppresses, by reason. It logs these counts at its end and when it "
-      "receives SIGUSR1."};
+      "what it refuses, drops and suppresses, by reason, for all messages together; `halvoxctl sql "
+      "'SELECT * FROM losses'` shows these counts."};
   switch (settings.server.use) {
     case StoreUse::kServed:
       sentences.emplace_back(
