@@ -152,7 +152,7 @@ TEST_F(MessageHistoryOverflowTest, VolumeMessagesDoNotMakeMessagesMoveOneByOne) 
   recordVolumes(0, 1000);
 
   EXPECT_GE(platform_.overflow.keptPieces(), 2U);
-  EXPECT_LE(platform_.overflow.keptPieces(), 30U);
+  EXPECT_LE(platform_.overflow.keptPieces(), 8U);
   EXPECT_EQ(recorded().size(), 1000U);
 }
 
