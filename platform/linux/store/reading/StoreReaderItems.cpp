@@ -75,14 +75,15 @@ class BlockCursor final : public ItemCursor {
   bool found_ = false;
 };
 
-// Events of earlier versions, which are not in blocks.
-class EventCursor final : public ItemCursor {
+// Records that are not in blocks. Their scan reads them in pieces.
+template <typename Scan, typename Piece>
+class PieceCursor : public ItemCursor {
  public:
-  EventCursor(Database& database, const RecordFilter& filter) : scan_(database, filter) {}
+  explicit PieceCursor(Scan scan) : scan_(std::move(scan)) {}
 
-  SqliteCode begin() override { return scan_.begin(); }
-  SqliteCode advance() override {
-    while (next_ == piece_.events.size()) {
+  SqliteCode begin() final { return scan_.begin(); }
+  SqliteCode advance() final {
+    while (next_ == size()) {
       if (scan_.isAtEnd()) {
         isAtEnd_ = true;
         return SQLITE_OK;
@@ -91,44 +92,50 @@ class EventCursor final : public ItemCursor {
       if (code != SQLITE_OK) return code;
       next_ = 0;
     }
-    const EventScan::Event& event = piece_.events[next_++];
+    show(next_++);
+    return SQLITE_OK;
+  }
+
+ protected:
+  // The number of records in the piece, and what makes one of them the item.
+  [[nodiscard]] virtual std::size_t size() const = 0;
+  virtual void show(std::size_t index) = 0;
+
+  Scan scan_;
+  Piece piece_;
+
+ private:
+  std::size_t next_ = 0;
+};
+
+// Events of earlier versions, which are not in blocks.
+class EventCursor final : public PieceCursor<EventScan, EventScan::Piece> {
+ public:
+  EventCursor(Database& database, const RecordFilter& filter)
+      : PieceCursor(EventScan(database, filter)) {}
+
+ private:
+  [[nodiscard]] std::size_t size() const override { return piece_.events.size(); }
+  void show(std::size_t index) override {
+    const EventScan::Event& event = piece_.events[index];
     item_ = {};
     item_.id = event.id;
     item_.time = event.time;
     item_.name = scan_.nameOf(event.nameID);
     item_.payload = piece_.payloads[event.payload];
-    return SQLITE_OK;
   }
-
- private:
-  EventScan scan_;
-  EventScan::Piece piece_;
-  std::size_t next_ = 0;
 };
 
 // The records of one kind of which each has a row of its own.
-class RowCursor final : public ItemCursor {
+class RowCursor final : public PieceCursor<RecordScan, std::vector<StoredRecord>> {
  public:
   RowCursor(Database& database, const RecordTable& table, const RecordFilter& filter)
-      : table_(table), scan_(database, table, filter) {}
-
-  SqliteCode begin() override { return scan_.begin(); }
-  SqliteCode advance() override {
-    while (next_ == piece_.size()) {
-      if (scan_.isAtEnd()) {
-        isAtEnd_ = true;
-        return SQLITE_OK;
-      }
-      const SqliteCode code = scan_.next(piece_);
-      if (code != SQLITE_OK) return code;
-      next_ = 0;
-    }
-    show(piece_[next_++]);
-    return SQLITE_OK;
-  }
+      : PieceCursor(RecordScan(database, table, filter)), table_(table) {}
 
  private:
-  void show(const StoredRecord& record) {
+  [[nodiscard]] std::size_t size() const override { return piece_.size(); }
+  void show(std::size_t index) override {
+    const StoredRecord& record = piece_[index];
     item_ = {};
     item_.table = &table_;
     item_.id = record.id;
@@ -158,9 +165,6 @@ class RowCursor final : public ItemCursor {
   }
 
   const RecordTable& table_;
-  RecordScan scan_;
-  std::vector<StoredRecord> piece_;
-  std::size_t next_ = 0;
 };
 
 using Cursors = std::vector<std::unique_ptr<ItemCursor>>;

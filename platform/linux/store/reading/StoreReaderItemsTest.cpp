@@ -111,6 +111,19 @@ TEST_F(StoreReaderItemsTest, StopsAfterTheRecordThatWasEnough) {
   EXPECT_THAT(readUpTo(10), SizeIs(3));
 }
 
+TEST_F(StoreReaderItemsTest, ReadsOldEventsAndRowsOfOtherKindsInTheirPlaces) {
+  start();
+  sendAt(1003, 3);
+  ASSERT_TRUE(store->issueMetrics().add({.time = 1002, .metricID = 5, .message = {}}));
+  ASSERT_TRUE(allIsStored());
+  execute(database(),
+          "INSERT INTO event_names VALUES (1, 'a'), (2, 'b');"
+          "INSERT INTO analytics_records VALUES (1, 1000.0, 1, 1001.0, 2, '{}')");
+
+  EXPECT_THAT(read({.metrics = true}),
+              ElementsAre("{}", "{}", "issue_metric_records0", numbered(3)));
+}
+
 TEST_F(StoreReaderItemsTest, ReadsNoMessagesUnlessAsked) {
   start();
   sendAt(1000, 1);
