@@ -12,35 +12,33 @@
 namespace halvox::tools {
 namespace {
 
-using client::Failure;
-using client::Result;
 using platform::Array;
 using platform::Value;
 
 constexpr ServiceType kUnknownService = 65535;
 
-std::string_view nameOf(Failure::Kind kind) {
+std::string_view nameOf(client::Failure::Kind kind) {
   switch (kind) {
-    case Failure::Kind::kNoService:
+    case client::Failure::Kind::kNoService:
       return "no-service";
-    case Failure::Kind::kRefused:
+    case client::Failure::Kind::kRefused:
       return "refused";
-    case Failure::Kind::kTimedOut:
+    case client::Failure::Kind::kTimedOut:
       return "timed-out";
-    case Failure::Kind::kBadRequest:
+    case client::Failure::Kind::kBadRequest:
       return "bad-request";
   }
   return "unknown";
 }
 
-ExitStatus statusOf(Failure::Kind kind) {
+ExitStatus statusOf(client::Failure::Kind kind) {
   switch (kind) {
-    case Failure::Kind::kNoService:
-    case Failure::Kind::kTimedOut:
+    case client::Failure::Kind::kNoService:
+    case client::Failure::Kind::kTimedOut:
       return ExitStatus::kNoService;
-    case Failure::Kind::kRefused:
+    case client::Failure::Kind::kRefused:
       return ExitStatus::kRefused;
-    case Failure::Kind::kBadRequest:
+    case client::Failure::Kind::kBadRequest:
       return ExitStatus::kBadArguments;
   }
   return ExitStatus::kRefused;
@@ -139,7 +137,7 @@ class RequestRunner::Execution {
     return ExitStatus::kDone;
   }
 
-  ExitStatus complain(const char* command, const Failure& failure) {
+  ExitStatus complain(const char* command, const client::Failure& failure) {
     errors_ << prefix_ << command << ": " << harmlessText(failure.message);
     if (!failure.name.empty()) errors_ << " (" << harmlessText(failure.name) << ")";
     errors_ << '\n';
@@ -162,10 +160,11 @@ class RequestRunner::Execution {
   }
 
   // Reports the answer to a request that is answered with yes or no. Prints nothing after yes.
-  ExitStatus report(const char* command, std::optional<ReporterID> id, const Result<bool>& result) {
+  ExitStatus report(const char* command, std::optional<ReporterID> id,
+                    const client::Result<bool>& result) {
     if (!result) return complain(command, *result.failure);
     if (!*result.value) {
-      return complain(command, {Failure::Kind::kRefused, "", "the service answered no"});
+      return complain(command, {client::Failure::Kind::kRefused, "", "the service answered no"});
     }
     Dictionary fields{{"command", command}};
     if (id) fields.set("id", *id);
@@ -177,10 +176,10 @@ class RequestRunner::Execution {
   // A start without an answer does not mean a broken connection: the session is still running.
   ExitStatus reportWait(const char* command, ReporterID id, std::chrono::milliseconds time) {
     const auto answer = connection_->waitForStartReply(id, time);
-    if (answer || answer.failure->kind != Failure::Kind::kTimedOut) {
+    if (answer || answer.failure->kind != client::Failure::Kind::kTimedOut) {
       return report(command, id, answer);
     }
-    complain(command, {Failure::Kind::kTimedOut, "",
+    complain(command, {client::Failure::Kind::kTimedOut, "",
                        "the start was not answered in time; the service answers it at the stop"});
     return ExitStatus::kRefused;
   }
