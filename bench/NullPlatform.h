@@ -2,7 +2,6 @@
 
 #include <deque>
 #include <filesystem>
-#include <map>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -19,6 +18,7 @@
 #include "platform/feature_flags.h"
 #include "platform/kdebug.h"
 #include "platform/linux/files/FileOverflowService.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/log.h"
 #include "platform/process.h"
 #include "platform/services.h"
@@ -172,17 +172,6 @@ class NullProcess final : public platform::ProcessService {
   [[noreturn]] void terminate(int /*exitStatus*/) override { std::abort(); }
 };
 
-// Real counters, because counting is part of the cost of a message.
-class MapStatistics final : public platform::StatisticsService {
- public:
-  platform::Counter& counter(std::string_view piece, std::string_view name) override {
-    return counters_[{std::string(piece), std::string(name)}];
-  }
-
- private:
-  std::map<std::pair<std::string, std::string>, platform::Counter> counters_;
-};
-
 // Owns all services and installs them. Must live as long as the process: the code under test keeps
 // references to log categories in static variables.
 struct NullPlatform {
@@ -211,7 +200,8 @@ struct NullPlatform {
   AbsentResultsFiles resultsFiles;
   NullLog log;
   NullProcess process;
-  MapStatistics statistics;
+  // Real counters, because counting is part of the cost of a message.
+  platform::linux_::CounterStatisticsService statistics;
   // The real service. Without it, a long history would lose messages and cost less than in the
   // service.
   platform::linux_::FileOverflowService overflow{

@@ -16,6 +16,7 @@
 #include <unistd.h>
 
 #include "bench/TypicalMessage.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/store/PayloadEncoder.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"
 #include "platform/linux/store/SqliteStore.h"
@@ -34,16 +35,6 @@ class SystemClock final : public ClockService {
   [[nodiscard]] LocalTime localTime(Date /*date*/) const override { return {}; }
   [[nodiscard]] std::chrono::duration<double> systemUptime() const override { return {}; }
   [[nodiscard]] std::chrono::milliseconds processUptime() const override { return {}; }
-};
-
-class PlainStatistics final : public StatisticsService {
- public:
-  Counter& counter(std::string_view /*piece*/, std::string_view /*name*/) override {
-    return counter_;
-  }
-
- private:
-  Counter counter_;
 };
 
 Dictionary makeMessage() {
@@ -108,7 +99,7 @@ struct Bench {
 
   std::filesystem::path directory;
   SystemClock clock;
-  PlainStatistics statistics;
+  CounterStatisticsService statistics;
   Backpressure backpressure;
   std::unique_ptr<SqliteStore> store;
   std::unique_ptr<SqliteAnalyticsService> service;
