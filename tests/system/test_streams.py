@@ -172,7 +172,7 @@ class StreamsTest(unittest.TestCase):
         self.assertIn("It lost 21 ms in 1 xrun: 1 because another one was late.\n", text)
         self.assertIn("It lost 21 ms in 2 cycles: browser was late, of process web.\n", text)
         lines = self.json("streams", "show", 7)
-        self.assertEqual(lines[0], stream)
+        self.assertEqual(lines[0], {**stream, "moments_not_shown": 0})
         self.assertEqual([line["moment"] for line in lines[1:]],
                          ["began", "start", "volume", "xrun", "stop", "ended"])
 
