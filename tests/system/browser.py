@@ -39,8 +39,9 @@ class Browser:
         self._directory = tempfile.mkdtemp(prefix="halvox-browser-")
         to_browser, self._write = os.pipe()
         self._read, from_browser = os.pipe()
-        # The browser reads descriptor 3 and writes descriptor 4.
-        command = ["sh", "-c", f'exec 3<&{to_browser} 4>&{from_browser}; exec "$@"', "sh",
+        # The browser reads descriptor 3 and writes descriptor 4. Other shells than bash do not copy
+        # descriptors of two digits.
+        command = ["bash", "-c", f'exec 3<&{to_browser} 4>&{from_browser}; exec "$@"', "bash",
                    program(), *OPTIONS, f"--user-data-dir={self._directory}", "about:blank"]
         with open(os.path.join(self._directory, "log"), "wb") as log:
             self._process = subprocess.Popen(
