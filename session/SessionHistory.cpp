@@ -36,7 +36,7 @@ void SessionHistory::begin() {
   const Lock history = lock();
   history->swap(previous);
   volumes_.swap(volumes);
-  nextTry_ = {};
+  nextTry_ = nextVolumeTry_ = {};
 }
 
 std::optional<MessageHistory> SessionHistory::end() {
@@ -127,7 +127,8 @@ bool SessionHistory::tryToMoveOut(MessageHistory& messages) {
   if (!error.has_value()) {
     // The message has room now. If the volume messages cannot be moved, they stay in memory: there
     // are at most two a second, and they grow only while messages are recorded.
-    if (volumes_->movableSize() >= kLeastToMove && volumes_->moveOut()) nextTry_ = now + kRetryTime;
+    const bool isTry = volumes_->movableSize() >= kLeastToMove && now >= nextVolumeTry_;
+    if (isTry && volumes_->moveOut()) nextVolumeTry_ = now + kRetryTime;
     return true;
   }
   nextTry_ = now + kRetryTime;

@@ -85,7 +85,9 @@ class SessionHistory {
   Guarded<std::optional<MessageHistory>> history_;
   // The lock of history_ guards both.
   std::unique_ptr<VolumeHistory> volumes_;  // null outside a run
-  std::chrono::milliseconds nextTry_{0};    // after a failed write, in the process's uptime
+  // After a failed write, in the process's uptime.
+  std::chrono::milliseconds nextTry_{0};
+  std::chrono::milliseconds nextVolumeTry_{0};
 };
 
 }  // namespace halvox
