@@ -60,14 +60,18 @@ bool HVReportingClientServerInstance::stop(const Session& session, platform::Job
 
 void HVReportingClientServerInstance::finishStop(SessionStop& rest, const platform::Job& finished) {
   std::exception_ptr failure;
-  try {
-    rest.finish();
-    isStopping_ = false;
-    finished();  // may begin the next stop
-  } catch (...) {
-    isStopping_ = false;
-    failure = std::current_exception();
-  }
+  const auto carryOut = [&](const auto& step) {
+    try {
+      step();
+    } catch (...) {
+      if (!failure) failure = std::current_exception();
+    }
+  };
+  carryOut([&] { rest.finish(); });
+  isStopping_ = false;
+  // Also after a failure, because a client would be kept for ever whose clean-up does not go on. It
+  // may begin the next stop.
+  carryOut(finished);
   carryOutPostponed();
   if (failure) std::rethrow_exception(failure);
 }
