@@ -22,9 +22,10 @@ class Counter {
 // Whether a counter of that name counts what was not delivered. The names are for people: "dropped:
 // disk full", "events lost by the tracer".
 [[nodiscard]] inline bool isLoss(std::string_view counterName) {
-  constexpr std::array<std::string_view, 9> kWords{"dropped",      "suppressed", "refused",
-                                                   "discarded",    "failed",     "lost",
-                                                   "not recorded", "timed out",  "malformed"};
+  constexpr std::array<std::string_view, 13> kWords{
+      "dropped",   "suppressed",       "refused",   "discarded",    "failed",
+      "lost",      "skipped",          "given up",  "not recorded", "timed out",
+      "malformed", "not acknowledged", "unfinished"};
   return std::ranges::any_of(kWords, [&](std::string_view word) {
     return counterName.find(word) != std::string_view::npos;
   });

@@ -45,9 +45,9 @@ std::vector<LossRecords::Loss> LossRecords::grown() const {
 
 SqliteCode LossRecords::write(TransactionAllowance& /*allowance*/) {
   const double now = clock_.currentDate().secondsSince1970;
-  if (!written_.empty() || !isDue(now)) return SQLITE_OK;
+  if (writtenAt_ || !isDue(now)) return SQLITE_OK;
   isFinishing_ = false;
-  lastTime_ = now;
+  writtenAt_ = now;
   written_ = grown();
   for (const Loss& loss : written_) {
     const SqliteCode code = writeRow(loss, now);
@@ -72,11 +72,13 @@ void LossRecords::onCommitted(FinishedRecords& /*finished*/) {
   spans_.onCommitted();
   for (const Loss& loss : written_) recorded_[loss.name] = loss.total;
   written_.clear();
+  if (writtenAt_) lastTime_ = *std::exchange(writtenAt_, std::nullopt);
 }
 
 std::uint64_t LossRecords::dropTaken(DropReason /*reason*/, FinishedRecords& /*finished*/) {
   spans_.onRolledBack();
   written_.clear();
+  writtenAt_ = std::nullopt;
   isFinishing_ = false;
   return 0;
 }

@@ -67,7 +67,8 @@ class LossRecords final : public RecordKind {
   Statement insert_;
   std::map<Name, std::uint64_t> recorded_;  // the totals that the store has
   std::vector<Loss> written_;               // in the open transaction
-  double lastTime_;                         // of the last records, or of the start
+  std::optional<double> writtenAt_;         // if the open transaction has looked at the counters
+  double lastTime_;                         // of the last transaction that did, or of the start
   bool isFinishing_ = false;
 };
 

@@ -111,6 +111,26 @@ TEST_F(LossRecordsTest, WhatAFailedTransactionHadComesWithTheNextOne) {
               ElementsAre("analytics|dropped: database locked|1", "session|dropped: a|5"));
 }
 
+TEST_F(LossRecordsTest, AFailedTransactionDoesNotDelayThem) {
+  start();
+  storeOne();
+  count("session", "dropped: a", 5);
+  platform.clock.setCurrentDate({kNow + 60});
+  {
+    Database other;
+    ASSERT_EQ(other.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
+    ASSERT_TRUE(eventually([&] { return other.execute("BEGIN IMMEDIATE") == SQLITE_OK; }));
+    send(2);
+    ASSERT_TRUE(eventually([&] { return counted("dropped: database locked") == 1; }));
+  }
+
+  storeOne();  // at the same time
+
+  EXPECT_THAT(losses(),
+              ElementsAre("analytics|dropped: database locked|1", "session|dropped: a|5"));
+  stop();
+}
+
 TEST_F(LossRecordsTest, TheyAgeLikeAllRecords) {
   start();
   count("session", "dropped: a");
