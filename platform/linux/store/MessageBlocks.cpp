@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <string>
 #include <utility>
+#include <vector>
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -168,7 +169,39 @@ SqliteCode MessageBlocks::addLink(double time, const LinkHead& head, std::string
 SqliteCode MessageBlocks::afterAdding() {
   ++next_;
   const bool isFull = writer_.records() >= kMostRecords || writer_.bytes() >= kMostBytes;
-  return isFull ? insert(Row::kSealed) : SQLITE_OK;
+  if (!isFull) return SQLITE_OK;
+  if (firstOpen_ >= gathered_.first) return insert(Row::kSealed);
+  // begin() expected a few records and left the open rows as they are, but long records fill a
+  // block all the same. Readers look for open rows only after the last sealed one.
+  const SqliteCode code = insert(Row::kOpen);
+  return code == SQLITE_OK ? sealEachOpenRow() : code;
+}
+
+// Makes each open row a sealed one.
+SqliteCode MessageBlocks::sealEachOpenRow() {
+  struct OpenRow {
+    std::int64_t id;
+    std::int64_t records;
+    std::string block;
+  };
+  std::vector<OpenRow> rows;
+  SqliteCode code = SQLITE_ROW;
+  while ((code = statements_.openRows.step()) == SQLITE_ROW) {
+    rows.push_back({statements_.openRows.integer(0), statements_.openRows.integer(1),
+                    std::string(statements_.openRows.bytes(2))});
+  }
+  statements_.openRows.reset();
+  if (code != SQLITE_DONE) return code;
+  statements_.deleteOpenRows.bind(1, firstOpen_);
+  code = statements_.deleteOpenRows.run();
+  for (const OpenRow& row : rows) {
+    if (code != SQLITE_OK) break;
+    gathered_.first = row.id;
+    code = gatherBlock(row.block, row.records, std::nullopt);
+    if (code == SQLITE_OK && row.records > 0) code = insert(Row::kSealed);
+  }
+  openBytes_ = 0;
+  return code;
 }
 
 SqliteCode MessageBlocks::end() {

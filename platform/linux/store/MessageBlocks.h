@@ -83,6 +83,7 @@ class MessageBlocks {
 
   [[nodiscard]] SqliteCode readState();
   [[nodiscard]] SqliteCode sealOpenRows();
+  [[nodiscard]] SqliteCode sealEachOpenRow();
   [[nodiscard]] SqliteCode gatherOpenRows();
   [[nodiscard]] SqliteCode gatherBlock(std::string_view block, std::int64_t records,
                                        std::optional<double> newerThan);

@@ -115,6 +115,28 @@ TEST_F(MessageBlocksTest, LongPayloadsThatAreAlikeAreAllKept) {
   EXPECT_EQ(value("SELECT sum(records), max(id + records) FROM message_blocks"), "40|41");
 }
 
+// A few long records fill a block in one transaction, after which the rows before it must be
+// sealed.
+TEST_F(MessageBlocksTest, RowsBeforeABlockOfLongPayloadsAreKept) {
+  constexpr std::int64_t kCount = 40;
+  start();
+  for (std::int64_t number = 0; number < 3; ++number) {
+    send(number);
+    ASSERT_TRUE(allIsStored());
+  }
+  for (std::int64_t number = 3; number < kCount; ++number) {
+    service->sendAnalyticsEventLazy("long", [number] {
+      return Dictionary{{"number", number}, {"text", std::string(100'000, 'x')}};
+    });
+  }
+  ASSERT_TRUE(allIsStored());
+
+  EXPECT_EQ(payloads().size(), static_cast<std::size_t>(kCount));
+  EXPECT_EQ(read({}).size(), static_cast<std::size_t>(kCount));
+  stop();
+  EXPECT_EQ(read({}).size(), static_cast<std::size_t>(kCount));
+}
+
 TEST_F(MessageBlocksTest, FollowerMeetsEachRecordOnceWhileRowsAreJoined) {
   start();
   EventFollower follower;
