@@ -137,7 +137,10 @@ class TailTest(WithMessages):
                                 " AND payload ->> 'number' IS NOT NULL", since)
             names = 2 if command == "events" else 1
             shown = follower.rows_to(self.MESSAGES - 1, names)
-            self.assertEqual(follower.errors(), "")
+            # On a busy machine the store may remove rows before a follower reads them, which it says.
+            # What is still stored, it must have shown.
+            self.assertIn(follower.errors(), ("", f"halvoxctl {command}: rows are missing: the store"
+                                                  " removed them before they were read\n"))
             ids = [int(re.fullmatch(rf"{command}:(\d+)@.*", row["cursor"])[1]) for row in shown]
             self.assertEqual(ids, sorted(set(ids)), "a row was repeated, or the order is wrong")
             rows = [(row["time"], row["payload"]["number"]) for row in shown]
