@@ -608,6 +608,9 @@ TEST(StreamBuilderMemoryTest, AMillionRecordsTakeNoMoreMemoryThanAThousand) {
 
   feed(0, 10);
   const std::size_t before = heapBytes();
+  if (before == 0) {
+    GTEST_SKIP() << "the heap of this build does not say how much it holds";
+  }
   feed(10, 1000);  // 1,000,000 records in all
   const std::size_t after = heapBytes();
   builder.finish({});
