@@ -33,6 +33,11 @@ else()
   set(HALVOX_SYSTEM_TEST_SECONDS 300)
 endif()
 
+# `ctest --parallel N` fills N slots. A system test uses a tenth of a processor, because it waits for
+# other programs, and takes one slot. A test that computes takes two. Two processors are therefore
+# kept busy, and not overloaded, by four slots.
+set(HALVOX_BUSY_TEST_SLOTS 2)
+
 # What guides the fuzzers: code in the libraries and in the fuzzers that records where it has been.
 # Tests are built without this, because it would only slow down their compilation and their runs.
 add_library(halvox_fuzzed INTERFACE)
@@ -177,7 +182,8 @@ function(halvox_test name)
   # which `ctest -L` finds by any of its parts: unit-concurrent.
   string(REPLACE ";" "-" labels "${ARG_LABELS}")
   gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST
-    PROPERTIES LABELS "${labels}" TIMEOUT ${HALVOX_UNIT_TEST_SECONDS})
+    PROPERTIES LABELS "${labels}" TIMEOUT ${HALVOX_UNIT_TEST_SECONDS}
+      PROCESSORS ${HALVOX_BUSY_TEST_SLOTS})
 endfunction()
 
 # halvox_fuzzer(<name> SOURCES <files> [DEPENDS <targets>])
@@ -194,6 +200,7 @@ function(halvox_fuzzer name)
     add_executable(${name} ${ARG_SOURCES} ${CMAKE_SOURCE_DIR}/tests/fuzz/SeedDriver.cpp)
     add_test(NAME fuzz_seeds.${name} COMMAND ${name} ${seeds})
   endif()
-  set_tests_properties(fuzz_seeds.${name} PROPERTIES LABELS unit TIMEOUT ${HALVOX_UNIT_TEST_SECONDS})
+  set_tests_properties(fuzz_seeds.${name} PROPERTIES
+    LABELS unit TIMEOUT ${HALVOX_UNIT_TEST_SECONDS} PROCESSORS ${HALVOX_BUSY_TEST_SLOTS})
   target_link_libraries(${name} PRIVATE ${ARG_DEPENDS} halvox_flags halvox_fuzzed)
 endfunction()
