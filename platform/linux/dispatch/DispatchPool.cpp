@@ -36,20 +36,6 @@ asio::io_context& DispatchPool::context(QualityOfService quality) {
   return utility_.context();
 }
 
-bool DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline) {
-  // Set this before reading turns_. From here on, the last turn that ends calls reportIdle().
-  isAwaited_.store(true);
-  const MutexLock lock(mutex_);
-  while (turns_.load() > 0 && idle_.waitUntil(mutex_, deadline)) {
-  }
-  return turns_.load() <= 0;
-}
-
-void DispatchPool::reportIdle() {
-  const MutexLock lock(mutex_);
-  idle_.notifyAll();
-}
-
 void DispatchPool::stop() {
   isStopped_.store(true, std::memory_order_relaxed);
   // Stop the waits first, then the delayed jobs, then the threads. In any other order, a part that

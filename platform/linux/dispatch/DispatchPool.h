@@ -2,13 +2,11 @@
 
 #include <atomic>
 #include <chrono>
-#include <cstdint>
 #include <memory>
 
 #include <asio/io_context.hpp>
 
 #include "platform/dispatch.h"
-#include "platform/linux/base/Mutex.h"
 #include "platform/linux/dispatch/DelayedJobs.h"
 #include "platform/linux/dispatch/DispatchWaits.h"
 #include "platform/linux/dispatch/JobRunner.h"
@@ -39,22 +37,12 @@ class DispatchPool {
   // itself check whether the pool has stopped.
   [[nodiscard]] asio::io_context& context(QualityOfService quality);
   [[nodiscard]] JobRunner& runner() { return *runner_; }
+  [[nodiscard]] OpenTurns& turns() { return runner_->turns(); }
   [[nodiscard]] QueueLabels& labels() { return labels_; }
   [[nodiscard]] DelayedJobs& delayedJobs() { return delayedJobs_; }
   [[nodiscard]] DispatchWaits& waits() { return waits_; }
   // Relaxed, because a job that is added during the stop may be run or discarded.
   [[nodiscard]] bool isStopped() const { return isStopped_.load(std::memory_order_relaxed); }
-
-  // A queue calls beginTurn() when it requests a turn, and endTurn() when it has nothing left to
-  // run.
-  void beginTurn() { turns_.fetch_add(1); }
-  void endTurn() {
-    if (turns_.fetch_sub(1) == 1 && isAwaited_.load()) reportIdle();
-  }
-  // Waits until no queue has a job that can run now, at most until `deadline`. Does not wait for
-  // queues that wait on semaphores, nor for delayed jobs that are not due. Returns false at the
-  // deadline.
-  bool waitUntilIdle(std::chrono::steady_clock::time_point deadline);
 
   // Lets each thread end after the job that it runs. From now on, no wait on a semaphore ends.
   void stop();
@@ -67,16 +55,8 @@ class DispatchPool {
   void discardJobs();
 
  private:
-  void reportIdle() HALVOX_EXCLUDES(mutex_);
-
   const std::shared_ptr<JobRunner> runner_;
   QueueLabels labels_;
-  // These two are sequentially consistent with each other: either waitUntilIdle() sees that the
-  // last turn has ended, or endTurn() sees that a thread waits.
-  std::atomic<std::int64_t> turns_{0};
-  std::atomic<bool> isAwaited_{false};
-  Mutex mutex_;
-  Condition idle_;
   std::atomic<bool> isStopped_{false};
   PoolThreads urgent_{QualityOfService::kUserInteractive};
   PoolThreads utility_{QualityOfService::kUtility};

@@ -3,13 +3,15 @@
 #include <cstdint>
 
 #include "platform/dispatch.h"
+#include "platform/linux/dispatch/OpenTurns.h"
 #include "platform/log.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
 
-// Runs jobs for the queues and catches the exceptions that they throw. Shared by a service and all
-// its queues, because queues can outlive the service. Any thread may use it.
+// What all queues of a service share: runs their jobs, catches the exceptions that the jobs throw,
+// and counts the queues that have something to run. Shared by the service and its queues, because
+// queues can outlive the service. Any thread may use it.
 class JobRunner {
  public:
   // `log` and `statistics` must outlive the runner.
@@ -24,6 +26,7 @@ class JobRunner {
       reportFailure();
     }
   }
+  [[nodiscard]] OpenTurns& turns() { return turns_; }
   void countDiscarded(std::uint64_t jobs) { discarded_.add(jobs); }
 
  private:
@@ -33,6 +36,7 @@ class JobRunner {
   LogCategory& log_;
   Counter& failed_;
   Counter& discarded_;
+  OpenTurns turns_;
 };
 
 }  // namespace halvox::platform::linux_

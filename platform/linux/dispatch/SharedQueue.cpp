@@ -38,9 +38,9 @@ void SharedQueue::async(JobWeight /*weight*/, Job job) {
     label_.added.add();
     if (hasTurn_ || isWaiting_) return;
     hasTurn_ = true;
-    // Report the turn under the lock. From the moment when the job is in the queue, waitUntilIdle()
+    // Report the turn under the lock. From the moment when the job is in the queue, waitUntilNone()
     // must count its turn.
-    pool_->beginTurn();
+    pool_->turns().begin();
   }
   askForTurn();
 }
@@ -52,7 +52,7 @@ bool SharedQueue::tryEnter() {
     // If the queue has a turn, or will have one after a wait, earlier jobs come first.
     if (hasTurn_ || isWaiting_) return false;
     hasTurn_ = true;
-    pool_->beginTurn();
+    pool_->turns().begin();
   }
   label_.added.add();
   label_.atWork.fetch_add(1, std::memory_order_relaxed);
@@ -68,7 +68,7 @@ void SharedQueue::leave() {
     const MutexLock lock(mutex_);
     if (jobs_.empty()) {
       hasTurn_ = false;
-      pool_->endTurn();
+      pool_->turns().end();
       return;
     }
   }
@@ -104,7 +104,7 @@ void SharedQueue::resume(Job then) {
     // The job that began the wait may still be running. Its turn then runs `then`, too.
     if (hasTurn_) return;
     hasTurn_ = true;
-    pool_->beginTurn();
+    pool_->turns().begin();
   }
   askForTurn();
 }
@@ -141,7 +141,7 @@ bool SharedQueue::runNext() {
     const MutexLock lock(mutex_);
     if (isWaiting_ || jobs_.empty()) {
       hasTurn_ = false;
-      pool_->endTurn();
+      pool_->turns().end();
       return false;
     }
     job = std::move(jobs_.front());
@@ -158,7 +158,7 @@ void SharedQueue::discardJobs() {
   std::deque<Job> discarded;
   {
     const MutexLock lock(mutex_);
-    if (hasTurn_) pool_->endTurn();
+    if (hasTurn_) pool_->turns().end();
     hasTurn_ = false;
     // Destroy the jobs after the lock is released, because the destructor of an object that a job
     // holds may add jobs to this queue.
