@@ -15,9 +15,10 @@ namespace {
 
 // How long the end of the service waits for running jobs to end.
 constexpr std::chrono::seconds kJobsEndWithin{5};
-// Before that, the end of the service waits for the queues of sessions to run their pending jobs.
-// The summary of a session of a million messages takes about a second. Several of them are made one
-// after the other. systemd kills a service that takes longer than 90 seconds to end.
+// Before that, the end of the service waits for all queues to run their pending jobs: the requests
+// that were read, the summary files, and the queues of sessions. The summary of a session of a
+// million messages takes about a second. Several of them are made one after the other. systemd
+// kills a service that takes longer than 90 seconds to end.
 constexpr AsioDispatchService::FinishLimits kQueuesFinish{
     .withoutProgress = std::chrono::seconds(5), .total = std::chrono::seconds(30)};
 
@@ -121,10 +122,12 @@ bool LinuxPlatform::close() {
   // being read.
   adapters_->traces->stop();
   // A message that was answered without an error must reach the link. The queue of its session may
-  // still hold it, because these queues have a lower priority than requests.
+  // still hold it, because these queues have a lower priority than requests. A stop that has begun
+  // must report its run: its file, its event and the requests that wait for it move between a
+  // shared queue and the reporting queue.
   if (const std::uint64_t jobs = adapters_->dispatch.finish(kQueuesFinish); jobs > 0) {
-    log_.error("the queues of sessions have not finished in time; discarding ", jobs,
-               " jobs: their messages and summaries do not reach the link");
+    log_.error("the queues have not finished in time; discarding ", jobs,
+               " jobs: their requests, messages and summaries are lost");
   }
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();

@@ -1,6 +1,7 @@
 """Messages that a started session sends through the link are in the local store, in order, each
 once."""
 
+import contextlib
 import json
 import os
 import shutil
@@ -14,6 +15,11 @@ from harness import Service, wait_for
 
 MESSAGES = 500
 SINGLE_MESSAGES = 3000
+# So much that a summary file takes a while, and that its event is made by the link's queue.
+LONG_MESSAGES = 2500
+WIDE = {f"key {number}": "x" * 10 for number in range(60)}
+SUMMARY = 0xFFFF  # the type of the event
+REPORTING = "Logs/Wreckbin/DiagnosticLogs/Audio/Reporting"
 
 
 def link_messages(service, *arguments):
@@ -23,6 +29,16 @@ def link_messages(service, *arguments):
          "--database", str(service.database), *arguments],
         stdout=subprocess.PIPE, text=True, check=True, timeout=harness.DEADLINE)
     return [json.loads(line) for line in shown.stdout.splitlines()]
+
+
+def is_writing_summary(service):
+    """Whether the service has a summary file open."""
+    directory = f"/proc/{service.process.pid}/fd"
+    for name in os.listdir(directory):
+        with contextlib.suppress(FileNotFoundError):
+            if REPORTING in (path := os.readlink(os.path.join(directory, name))) and "#" in path:
+                return True
+    return False
 
 
 def numbers_of(messages):
@@ -82,6 +98,28 @@ class LinkLocal(unittest.TestCase):
         with Service(directory=directory) as service:
             self.run_session(service)
         self.assertEqual(numbers_of(link_messages(service)), list(range(MESSAGES)))
+
+    def test_end_during_a_summary_file_finishes_the_stop_and_what_waits_for_it(self):
+        directory = tempfile.mkdtemp(prefix="halvox-test-")
+        self.addCleanup(shutil.rmtree, directory, True)
+        with Service("[device]\nInternalBuild = true\n", directory=directory) as service:
+            client = service.client()
+            self.addCleanup(client.close)
+            client.create(7)
+            client.set_type(7, 7)
+            client.start_later(7)
+            for number in range(LONG_MESSAGES):
+                client.send({"number": number, **WIDE}, reporters=[7])
+            client.call_later("stopReportingSessionForID", "x", 7)
+            client.connection.flush_sync(None)
+            wait_for("the summary file", lambda: is_writing_summary(service), pause=0.001)
+
+        (name,) = (service.directory / "state" / "root").glob(f"**/{REPORTING}/*.json")
+        self.assertEqual(len(json.loads(name.read_text())), LONG_MESSAGES)
+        messages = link_messages(service)
+        self.assertEqual(numbers_of(messages), list(range(LONG_MESSAGES)))
+        self.assertEqual(messages[-1]["type"], SUMMARY)
+        self.assertNotIn("jobs discarded at the stop", service.log())
 
     def test_without_a_backend_nothing_is_stored_and_clients_notice_nothing(self):
         with Service('[link]\nbackend = "none"\n') as service:

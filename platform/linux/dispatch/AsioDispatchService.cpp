@@ -51,16 +51,27 @@ void AsioDispatchService::wakePool() { DispatchThread::current().wakePool(); }
 std::uint64_t AsioDispatchService::finish(const FinishLimits& limits) {
   wakePool();  // starts the turns that this thread still holds back
   const auto end = std::chrono::steady_clock::now() + limits.total;
-  QueueLabels::Jobs before = pool_->labels().jobs();
+  QueueLabels::Jobs before = jobs();
   while (true) {
     const auto now = std::chrono::steady_clock::now();
-    if (pool_->waitUntilIdle(std::min(now + limits.withoutProgress, end))) return 0;
-    const QueueLabels::Jobs jobs = pool_->labels().jobs();
-    if (jobs.run == before.run || std::chrono::steady_clock::now() >= end) {
-      return jobs.added - jobs.run;
+    if (pool_->turns().waitUntilNone(std::min(now + limits.withoutProgress, end))) return 0;
+    const QueueLabels::Jobs after = jobs();
+    if (after.run == before.run || std::chrono::steady_clock::now() >= end) {
+      return after.added - after.run;
     }
-    before = jobs;
+    before = after;
   }
+}
+
+QueueLabels::Jobs AsioDispatchService::jobs() {
+  QueueLabels::Jobs sum = pool_->labels().jobs();
+  const MutexLock lock(mutex_);
+  for (const auto& queue : ownThreadQueues_) {
+    const QueueLabels::Jobs jobs = queue->jobs();
+    sum.run += jobs.run;
+    sum.added += jobs.added;
+  }
+  return sum;
 }
 
 bool AsioDispatchService::stop(std::chrono::milliseconds limit) {

@@ -9,6 +9,7 @@
 
 #include "platform/dispatch.h"
 #include "platform/linux/base/Mutex.h"
+#include "platform/linux/dispatch/QueueLabels.h"
 #include "platform/log.h"
 #include "platform/statistics.h"
 
@@ -70,9 +71,10 @@ class AsioDispatchService final : public DispatchService {
     std::chrono::milliseconds withoutProgress;
     std::chrono::milliseconds total;
   };
-  // Waits until the shared queues have run their jobs. An orderly end calls this to lose nothing.
-  // Does not wait for queues that wait on semaphores, nor for delayed jobs that are not due.
-  // Returns 0, or the number of jobs that had not run at the limit. Must not be called from a job.
+  // Waits until all queues have run their jobs, and the jobs that these add. An orderly end calls
+  // this to lose nothing. Does not wait for queues that wait on semaphores, nor for delayed jobs
+  // that are not due. Returns 0, or the number of jobs that had not run at the limit. Must not be
+  // called from a job.
   [[nodiscard]] std::uint64_t finish(const FinishLimits& limits);
   // Ends each thread after the job that it runs. Discards and counts all other jobs, and those that
   // are added later. Waits at most for `limit`. If a job still runs then, logs the labels of the
@@ -83,6 +85,8 @@ class AsioDispatchService final : public DispatchService {
  private:
   std::shared_ptr<DispatchQueue> createOwnThreadQueue(std::string_view label,
                                                       QualityOfService quality);
+  // The jobs of all queues together.
+  [[nodiscard]] QueueLabels::Jobs jobs() HALVOX_EXCLUDES(mutex_);
   void logStuck(const std::vector<std::string>& labels);
 
   LogCategory& log_;

@@ -231,9 +231,18 @@ TEST_F(AsioDispatchServiceTest, QueuesMayOutliveTheService) {
   EXPECT_EQ(count("jobs discarded at the stop"), 2U);
 }
 
-TEST_F(AsioDispatchServiceTest, FinishWaitsAsLongAsJobsEnd) {
+class AsioDispatchFinishTest : public AsioDispatchServiceTest,
+                               public testing::WithParamInterface<QueueThreading> {};
+
+INSTANTIATE_TEST_SUITE_P(Queues, AsioDispatchFinishTest,
+                         testing::Values(QueueThreading::kOwnThread, QueueThreading::kShared),
+                         [](const auto& one) {
+                           return one.param == QueueThreading::kShared ? "Shared" : "OwnThread";
+                         });
+
+TEST_P(AsioDispatchFinishTest, FinishWaitsAsLongAsJobsEnd) {
   constexpr int kJobs = 8;
-  const auto queue = createQueue(QueueThreading::kShared);
+  const auto queue = createQueue(GetParam());
   std::promise<void> never;
   const std::shared_future<void> longJob = never.get_future().share();
   std::atomic<int> ran{0};
@@ -250,10 +259,32 @@ TEST_F(AsioDispatchServiceTest, FinishWaitsAsLongAsJobsEnd) {
       0U);
 
   EXPECT_EQ(ran, kJobs);
+  EXPECT_TRUE(service_->stop(kTestDeadline));
 }
 
-TEST_F(AsioDispatchServiceTest, FinishEndsWithoutProgressAndSaysWhatIsLeft) {
-  StuckQueue stuck(*service_, "stuck", QueueThreading::kShared);
+// A summary file is written on a shared queue. The rest of the stop is a job of the reporting
+// queue, which has a thread of its own, and adds the last job to the queue of a link.
+TEST_F(AsioDispatchServiceTest, FinishWaitsForJobsThatJobsAddToOtherQueues) {
+  const auto shared = createQueue(QueueThreading::kShared);
+  const auto own = createQueue(QueueThreading::kOwnThread);
+  std::promise<void> never;
+  std::atomic<bool> hasEnded{false};
+  shared->async(JobWeight::kMayBlock, [&] {
+    own->async(JobWeight::kMayBlock, [&] {
+      // Without a job in the shared queue meanwhile, which finish() must not take for the end.
+      never.get_future().wait_for(std::chrono::milliseconds(100));
+      shared->async(JobWeight::kMayBlock, [&] { hasEnded = true; });
+    });
+  });
+
+  EXPECT_EQ(service_->finish({.withoutProgress = kTestDeadline, .total = kTestDeadline}), 0U);
+
+  EXPECT_TRUE(hasEnded);
+  EXPECT_TRUE(service_->stop(kTestDeadline));
+}
+
+TEST_P(AsioDispatchFinishTest, FinishEndsWithoutProgressAndSaysWhatIsLeft) {
+  StuckQueue stuck(*service_, "stuck", GetParam());
   const auto queue =
       service_->createSerialQueue("q", QualityOfService::kUtility, QueueThreading::kShared);
   queue->async(JobWeight::kBrief, [] {});
@@ -266,8 +297,8 @@ TEST_F(AsioDispatchServiceTest, FinishEndsWithoutProgressAndSaysWhatIsLeft) {
   stuck.release();
 }
 
-TEST_F(AsioDispatchServiceTest, FinishIsBoundedEvenIfJobsEndForEver) {
-  const auto queue = createQueue(QueueThreading::kShared);
+TEST_P(AsioDispatchFinishTest, FinishIsBoundedEvenIfJobsEndForEver) {
+  const auto queue = createQueue(GetParam());
   std::function<void()> again = [&] { queue->async(JobWeight::kBrief, again); };
   again();
 

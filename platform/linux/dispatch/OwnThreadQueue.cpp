@@ -43,6 +43,9 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
       return;  // the job is destroyed with the arguments, after the lock has been released
     }
     waiting_.push_back({std::move(job), weight});
+    ++added_;
+    // Under the lock: from the moment when the job is in the queue, its turn must count.
+    if (!std::exchange(hasTurn_, true)) runner_->turns().begin();
     if (hasWorker_) return;  // the worker looks for new jobs before it stops working
     // The helper has noted this queue already and will find the job.
     if (mayHelp && helper_ == &helper) return;
@@ -80,6 +83,7 @@ void OwnThreadQueue::stop() {
     // Destroy the jobs after the lock is released, because the destructor of an object that a job
     // holds may add jobs to this queue.
     discarded.swap(waiting_);
+    endTurnIfIdle();
     wakeUp_.notifyOne();
   }
   if (!discarded.empty()) runner_->countDiscarded(discarded.size());
@@ -118,6 +122,7 @@ void OwnThreadQueue::work(DispatchThread& thread) {
       mutex_.lock();
     }
     hasWorker_ = false;
+    endTurnIfIdle();
   }
 }
 
@@ -177,12 +182,18 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
       isFront = next_ == batch_.size();
     }
     hasWorker_ = false;
+    endTurnIfIdle();
     // After close() or stop(), wake the own thread even if there is no work, because it may be
     // waiting for this helper to finish.
     mustWake = (hasWork() || life_ != Life::kOpen) && takeWakeUp();
   }
   if (mustWake) wakeUp_.notifyOne();
   return done;
+}
+
+QueueLabels::Jobs OwnThreadQueue::jobs() const {
+  const MutexLock lock(mutex_);
+  return {.added = added_, .run = ran_.load(std::memory_order_relaxed)};
 }
 
 bool OwnThreadQueue::hasWork() const {
@@ -206,6 +217,12 @@ bool OwnThreadQueue::takeBatch() {
 // woken it yet.
 bool OwnThreadQueue::takeWakeUp() { return std::exchange(sleeps_, false); }
 
+// Call after each change that may leave the queue without a worker and without a job.
+void OwnThreadQueue::endTurnIfIdle() {
+  if (hasWorker_ || hasWork()) return;
+  if (std::exchange(hasTurn_, false)) runner_->turns().end();
+}
+
 bool OwnThreadQueue::canGoOn() const {
   return next_ < batch_.size() && !isStopped_.load(std::memory_order_relaxed);
 }
@@ -215,6 +232,7 @@ void OwnThreadQueue::runNext() {
   // released when the job has run and not only at the end of the batch.
   const Job job = std::move(batch_[next_++].job);
   runner_->run(job);
+  ran_.store(ran_.load(std::memory_order_relaxed) + 1, std::memory_order_relaxed);
 }
 
 }  // namespace halvox::platform::linux_

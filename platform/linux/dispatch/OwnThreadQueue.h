@@ -15,6 +15,7 @@
 #include "platform/linux/base/Mutex.h"
 #include "platform/linux/dispatch/DispatchThread.h"
 #include "platform/linux/dispatch/JobRunner.h"
+#include "platform/linux/dispatch/QueueLabels.h"
 
 namespace halvox::platform::linux_ {
 
@@ -69,6 +70,10 @@ class OwnThreadQueue final : public DispatchQueue,
   // Returns how many jobs it ran. `helper` is the calling thread.
   std::size_t help(const DispatchThread& helper, std::size_t limit);
 
+  // The numbers of jobs that were added and that have run. After stop() the discarded jobs count
+  // only as added.
+  [[nodiscard]] QueueLabels::Jobs jobs() const HALVOX_EXCLUDES(mutex_);
+
  private:
   enum class Life : std::uint8_t { kOpen, kClosed, kStopped };
   struct Item {
@@ -84,6 +89,7 @@ class OwnThreadQueue final : public DispatchQueue,
   [[nodiscard]] bool hasWork() const HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool takeBatch() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool takeWakeUp() HALVOX_REQUIRES(mutex_);
+  void endTurnIfIdle() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool canGoOn() const;
   void runNext();
   void runNextInBatch(DispatchThread& thread);
@@ -101,6 +107,9 @@ class OwnThreadQueue final : public DispatchQueue,
   // first, and further jobs then cost no wake-up.
   bool sleeps_ HALVOX_GUARDED_BY(mutex_) = false;
   Life life_ HALVOX_GUARDED_BY(mutex_) = Life::kOpen;
+  // Whether this queue counts among the open turns: it has a job that runs or can run.
+  bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;
+  std::uint64_t added_ HALVOX_GUARDED_BY(mutex_) = 0;
   bool hasEnded_ HALVOX_GUARDED_BY(mutex_) = false;
   // The thread that will help this queue, or null. Brief jobs that it adds do not wake the own
   // thread.
@@ -108,6 +117,9 @@ class OwnThreadQueue final : public DispatchQueue,
   // Lets the worker end a batch early without taking the lock for each job. Relaxed, because
   // `life_` decides.
   std::atomic<bool> isStopped_{false};
+
+  // Written by the worker only. Relaxed, because it only shows the progress.
+  std::atomic<std::uint64_t> ran_{0};
 
   // The batch belongs to the worker. A thread becomes the worker under the mutex, and the mutex
   // orders its use of the batch after that of the previous worker.
