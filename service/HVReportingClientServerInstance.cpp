@@ -91,9 +91,9 @@ struct HVReportingClientServerInstance::RequestJob {
 
   void operator()() {
     HVReportingClientServerInstance& target = *client;
-    if (target.isStopping_) return target.postpone(std::move(*this));
+    if (target.isStopping()) return target.postpone(std::move(*this));
     work(target);
-    target.counters_->requests.carriedOut.add();
+    target.noteCarriedOut(std::move(token));
   }
 };
 
@@ -217,7 +217,7 @@ void HVReportingClientServerInstance::endOfRequests() {
 }
 
 void HVReportingClientServerInstance::carryOutSends(Messages& messages) {
-  if (isStopping_) {
+  if (isStopping()) {
     return postpone([client = shared_from_this(),
                      kept = std::make_shared<Messages>(std::exchange(messages, {}))] {
       client->carryOutSends(*kept);

@@ -123,6 +123,10 @@ class HVReportingClientServerInstance final
   void queueRequest(platform::JobWeight weight, RequestContext&& context, Member carryOut,
                     ReporterID reporterID, Reply&& reply);
 
+  // Counts a request whose work has returned. If the work began a stop whose file is still being
+  // written, keeps the token and counts the request when the stop is complete.
+  void noteCarriedOut(platform::RequestToken token);
+
   // The work of the requests, on the reporting queue.
   void carryOutCreate(ReporterID reporterID, const BoolReply& reply);
   void carryOutSetServiceType(AudioServiceType serviceType, ReporterID reporterID,
@@ -139,12 +143,20 @@ class HVReportingClientServerInstance final
   void carryOutGetAllReporters(const ReportersReply& reply) const;
   void carryOutConnectionError();
 
+  // A stop whose summary file is not complete.
+  struct OpenStop {
+    std::shared_ptr<SessionStop> rest;
+    platform::Job finished;
+    std::optional<platform::RequestToken> request{};  // of the request that is carried out then
+  };
   // Stops a started session. Returns true if the stop is complete. Otherwise the session is stopped
   // for all other clients, but its summary file is still being written. This client's requests wait
   // until the file is complete and `finished` has run, on the reporting queue.
   [[nodiscard]] bool stop(const Session& session, platform::Job finished);
-  void finishStop(SessionStop& rest, const platform::Job& finished);
-  // Keeps the job until the client's stop is complete.
+  void writeNextFile();
+  void finishFirstStop();
+  [[nodiscard]] bool isStopping() const { return !stops_.empty(); }
+  // Keeps the job until the client's stops are complete.
   void postpone(platform::Job job);
   void carryOutPostponed();
 
@@ -173,8 +185,8 @@ class HVReportingClientServerInstance final
   Guarded<std::optional<std::string>> clientProcessName_;
   // Reporting queue only.
   SessionMap sessions_;
-  bool isStopping_ = false;              // a summary file of this client is being written
-  std::deque<platform::Job> postponed_;  // its requests and clean-up meanwhile; hold this client
+  std::deque<OpenStop> stops_;           // the file of the first one is being written
+  std::deque<platform::Job> postponed_;  // its requests and clean-up meanwhile
   Messages posted_;                      // connection's thread only; not queued yet
 };
 

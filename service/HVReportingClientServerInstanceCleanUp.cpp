@@ -2,6 +2,7 @@
 #include <exception>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 #include "platform/dispatch.h"
 #include "platform/services.h"
@@ -43,22 +44,28 @@ void writeParts(const std::shared_ptr<platform::DispatchQueue>& queue,
 // carried out now. They cannot see how long a stop takes: the file, the event and the replies have
 // no order with what other clients do.
 //
-// The queue has the quality of requests, because a request waits for it. Each stop has a queue of
-// its own: the pool has two threads, and the files of further stops take turns.
+// The files of one client are written one after the other, each with the rest of its stop, although
+// a client that disconnects stops all its sessions at once. A client with many sessions then delays
+// the files of others by one part of a file at most.
 bool HVReportingClientServerInstance::stop(const Session& session, platform::Job finished) {
   const std::shared_ptr<SessionStop> rest = session->beginStop();
   if (rest == nullptr) return true;
-  isStopping_ = true;
-  const auto queue = platform::dispatch().createSerialQueue(
-      kFileQueueLabel, platform::QualityOfService::kUserInteractive,
-      platform::QueueThreading::kShared);
-  writeParts(queue, rest, [client = shared_from_this(), rest, finished = std::move(finished)] {
-    client->finishStop(*rest, finished);
-  });
+  stops_.push_back({.rest = rest, .finished = std::move(finished)});
+  if (stops_.size() == 1) writeNextFile();
   return false;
 }
 
-void HVReportingClientServerInstance::finishStop(SessionStop& rest, const platform::Job& finished) {
+// The queue has the quality of requests, because a request waits for it. Each file has a queue of
+// its own: the pool has two threads, and the files of several clients take turns.
+void HVReportingClientServerInstance::writeNextFile() {
+  const auto queue = platform::dispatch().createSerialQueue(
+      kFileQueueLabel, platform::QualityOfService::kUserInteractive,
+      platform::QueueThreading::kShared);
+  writeParts(queue, stops_.front().rest,
+             [client = shared_from_this()] { client->finishFirstStop(); });
+}
+
+void HVReportingClientServerInstance::finishFirstStop() {
   std::exception_ptr failure;
   const auto carryOut = [&](const auto& step) {
     try {
@@ -67,13 +74,30 @@ void HVReportingClientServerInstance::finishStop(SessionStop& rest, const platfo
       if (!failure) failure = std::current_exception();
     }
   };
-  carryOut([&] { rest.finish(); });
-  isStopping_ = false;
-  // Also after a failure, because a client would be kept for ever whose clean-up does not go on. It
-  // may begin the next stop.
-  carryOut(finished);
-  carryOutPostponed();
+  // Each step is carried out after a failure of the one before, because a client would be kept for
+  // ever whose stops and clean-up do not go on.
+  {
+    const OpenStop stop = std::move(stops_.front());
+    stops_.pop_front();
+    carryOut([&] { stop.rest->finish(); });
+    if (stop.finished) carryOut(stop.finished);
+    if (stop.request.has_value()) counters_->requests.carriedOut.add();
+  }
+  if (isStopping()) {
+    writeNextFile();
+  } else {
+    carryOutPostponed();
+  }
   if (failure) std::rethrow_exception(failure);
+}
+
+void HVReportingClientServerInstance::noteCarriedOut(platform::RequestToken token) {
+  // No request is carried out during a stop. If there is one now, this request has begun it.
+  if (isStopping()) {
+    stops_.back().request = std::move(token);
+  } else {
+    counters_->requests.carriedOut.add();
+  }
 }
 
 void HVReportingClientServerInstance::postpone(platform::Job job) {
@@ -83,7 +107,7 @@ void HVReportingClientServerInstance::postpone(platform::Job job) {
 // The connection bounds the number of these jobs, because each holds a request open.
 void HVReportingClientServerInstance::carryOutPostponed() {
   std::exception_ptr failure;
-  while (!isStopping_ && !postponed_.empty()) {
+  while (!isStopping() && !postponed_.empty()) {
     const platform::Job job = std::move(postponed_.front());
     postponed_.pop_front();
     try {
@@ -127,7 +151,8 @@ void HVReportingClientServerInstance::handleConnectionError() {
 }
 
 void HVReportingClientServerInstance::carryOutConnectionError() {
-  if (isStopping_) {
+  // Requests that wait for a stop arrived before the end of the connection.
+  if (isStopping() && !postponed_.empty()) {
     return postpone([client = shared_from_this()] { client->carryOutConnectionError(); });
   }
   const Delegate delegate = delegate_.lock();
@@ -138,15 +163,22 @@ void HVReportingClientServerInstance::carryOutConnectionError() {
   if (std::ranges::none_of(clients, [this](const auto& one) { return one.get() == this; })) return;
   // As for a destroyed session, the counter of active sessions does not change and held replies are
   // dropped. Both are required.
+  std::vector<Session> dropped;
   for (const auto& [reporterID, session] : sessions_) {
-    if (!session->started() || stop(session, [this] { carryOutConnectionError(); })) continue;
-    note(session, SessionChange::kStopped, delegate);
-    return;  // called again when the stop is complete
+    dropped.push_back(session);
+    if (session->started()) static_cast<void>(stop(session, {}));
   }
-  // Sessions are removed only after all of them have been stopped; this order is required.
+  // Other clients must not observe how long the files take: from here on they find neither the
+  // sessions nor the client.
   while (!sessions_.empty()) removeSession(sessions_.begin(), delegate);
   delegate->removeClient(*this);
-  kServiceLog.notice("removing ", processIdentifier_, " from the server client list");
+  // Sessions are released, and the line is logged, only after all sessions have been stopped. This
+  // order is required.
+  auto end = [this, dropped = std::move(dropped)]() mutable {
+    dropped.clear();
+    kServiceLog.notice("removing ", processIdentifier_, " from the server client list");
+  };
+  isStopping() ? postpone(std::move(end)) : end();
 }
 
 }  // namespace halvox

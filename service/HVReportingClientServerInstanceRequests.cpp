@@ -180,17 +180,23 @@ void HVReportingClientServerInstance::carryOutDestroy(ReporterID reporterID,
   }
   // Unlike a stop, this sends no driver logs, does not change the counter of active sessions, and
   // drops the held reply of the start. All three are required.
-  const auto finished = [this, reporterID, reply] {
-    const auto own = sessions_.find(reporterID);
-    if (own != sessions_.end()) removeSession(own, delegate_.lock());
+  const auto answer = [reporterID, reply] {
     kServiceLog.notice("destroying ", number(reporterID));
     reply(std::nullopt, true);
   };
-  Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
-  const bool isComplete = session == nullptr || !session->started() || stop(session, finished);
-  if (!isComplete) return note(session, SessionChange::kStopped, delegate_.lock());
-  session.reset();  // the map has the last reference
-  finished();
+  const auto own = sessions_.find(reporterID);
+  if (own == sessions_.end()) return answer();
+  Session session = own->second;
+  const bool isComplete = !session->started() || stop(session, [session, answer]() mutable {
+    session.reset();
+    answer();
+  });
+  // Removed at once, even if the file is still being written: other clients must not observe how
+  // long it takes.
+  removeSession(own, delegate_.lock());
+  if (!isComplete) return;
+  session.reset();  // the last reference; a session is released before the line is logged
+  answer();
 }
 
 void HVReportingClientServerInstance::carryOutReporterIDValid(ReporterID reporterID,

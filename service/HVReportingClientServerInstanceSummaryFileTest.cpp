@@ -173,12 +173,82 @@ TEST_F(HVReportingClientServerInstanceSummaryFileTest, TheCleanUpWritesTheFilesO
   EXPECT_FALSE(held_[0]->isAnswered());
 }
 
-TEST_F(HVReportingClientServerInstanceSummaryFileTest, ADestroyedSessionIsRemovedAfterItsFile) {
+// The other client's session has the same ID. Looked up across all clients, the session of the
+// client that registered first would come first.
+TEST_F(HVReportingClientServerInstanceSummaryFileTest,
+       TheSessionsOfAClientThatDisconnectsAreRemovedBeforeTheirFiles) {
+  startLong(8, AudioServiceType::kAlarms);
+
+  client_->invalidate();
+  const Call request = post(other_, "getAllReporters", {});
+  runUntilAnswered(request);
+  runUntilAnswered(post(other_, "createReportingSession", {7}));
+
+  EXPECT_EQ(request->value(), Value(Array{}));
+  EXPECT_THAT(delegate_->getAllActiveReportingSessions(), IsEmpty());
+  EXPECT_THAT(delegate_->getAllClients(), SizeIs(1));
+  EXPECT_EQ(delegate_->findReportingSessionForID(ReporterID{7}), sessionOf(other_, 7));
+  EXPECT_THAT(platform_.files.files(), IsEmpty());
+  run();
+}
+
+TEST_F(HVReportingClientServerInstanceSummaryFileTest,
+       AClientThatDisconnectsDuringAStopHasNoSessionsAnyMore) {
+  startLong(8, AudioServiceType::kAlarms);
+  const Call stop = beginStop(7);
+
+  client_->invalidate();
+  const Call request = post(other_, "getAllReporters", {});
+  runUntilAnswered(request);
+  EXPECT_EQ(request->value(), Value(Array{}));
+  EXPECT_THAT(delegate_->getAllActiveReportingSessions(), IsEmpty());
+  EXPECT_THAT(platform_.files.files(), IsEmpty());
+  run();
+
+  EXPECT_THAT(platform_.files.files(), SizeIs(2));
+  EXPECT_LT(at("stopping 7"), at("sending summary event for reporter 8"));
+  EXPECT_LT(at("sending summary event for reporter 8"),
+            at("removing 100 from the server client list"));
+}
+
+TEST_F(HVReportingClientServerInstanceSummaryFileTest,
+       TheRequestsOfAClientThatDisconnectsPrecedeItsCleanUp) {
+  beginStop(7);
+  post(client_, "startReportingSessionForID", {7});
+
+  client_->interrupt();
+  client_->invalidate();
+  run();
+
+  EXPECT_LT(at("starting session for reporter 7"), at("removing 100 from the server client list"));
+  EXPECT_THAT(delegate_->getAllActiveReportingSessions(), IsEmpty());
+  EXPECT_THAT(delegate_->getAllClients(), SizeIs(1));
+}
+
+TEST_F(HVReportingClientServerInstanceSummaryFileTest, AStopIsOpenUntilItIsAnswered) {
+  const auto carriedOut = [this] { return platform_.statistics.value("requests", "carried out"); };
+  const auto before = carriedOut();
+
+  const Call stop = beginStop(7);
+  runUntilAnswered(post(other_, "getAllReporters", {}));
+  EXPECT_EQ(client_->openRequests(), 1U);
+  EXPECT_EQ(carriedOut(), before + 1);
+  runUntilAnswered(stop);
+
+  EXPECT_EQ(client_->openRequests(), 0U);
+  EXPECT_EQ(carriedOut(), before + 2);
+}
+
+TEST_F(HVReportingClientServerInstanceSummaryFileTest,
+       ADestroyedSessionIsRemovedBeforeItsFileAndAnsweredAfterIt) {
   const Call destroy = post(client_, "destroyReportingSession", {7});
   const Call request = post(other_, "getAllReporters", {});
   runUntilAnswered(request);
   EXPECT_FALSE(destroy->isAnswered());
+  EXPECT_EQ(request->value(), Value(Array{}));
   EXPECT_THAT(delegate_->getAllActiveReportingSessions(), IsEmpty());
+  EXPECT_EQ(client_->openRequests(), 1U);
+  EXPECT_THAT(platform_.files.files(), IsEmpty());
   run();
 
   EXPECT_LT(at("sending summary event for reporter 7"), at("destroying 7"));

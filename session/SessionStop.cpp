@@ -6,7 +6,7 @@
 
 namespace halvox {
 
-// Releases the session, which its owner may be about to drop. From here on, the event is charged to
+// Releases the session, which its owner may have dropped. From here on, the event is charged to
 // the same account while it waits for the link.
 void SessionStop::finish() {
   std::exchange(session_, nullptr)->endStop(run_);

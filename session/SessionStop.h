@@ -16,7 +16,7 @@ class HVReportingSession;
 //   made --writePart() until it returns true--> written --finish()--> finished
 //
 // Made by HVReportingSession::beginStop(). The parts may be written on any thread, one after the
-// other. Holds the session, whose owner must not start, change or drop it before finish() has
+// other. Holds the session, which its owner must not start or change before finish() has
 // returned. If it is destroyed before that, for instance because the service ends, the run is not
 // reported. The history is charged to the session's account.
 class SessionStop {
