@@ -26,7 +26,8 @@ namespace {
 
 // The categories, and the service that they write to now. Outlives the services.
 struct Registry {
-  std::mutex mutex;
+  // Recursive, because a handler of the journal may run jobs, and these log.
+  std::recursive_mutex mutex;
   std::map<std::pair<std::string, std::string>, std::unique_ptr<FakeLogCategory>> categories;
   LogLevel level = LogLevel::kDebug;
   FakeLogService* receiver = nullptr;

@@ -107,6 +107,17 @@ TEST_F(FakeLogServiceTest, LinesAreInTheJournalWithoutPrefix) {
             (std::vector<JournalEntry>{{JournalKind::kLogLine, "line"}}));
 }
 
+TEST_F(FakeLogServiceTest, AHandlerOfTheJournalMayLog) {
+  platform_.journal.whenRecorded([](const JournalEntry& entry) {
+    if (entry.text == "outer") kLog.info("inner");
+  });
+
+  kLog.info("outer");
+  platform_.journal.whenRecorded(nullptr);
+
+  EXPECT_EQ(platform_.journal.texts(), (std::vector<std::string>{"outer", "inner"}));
+}
+
 TEST_F(FakeLogServiceTest, ClearForgetsTheLines) {
   kLog.info("line");
   platform_.log.clear();
