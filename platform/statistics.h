@@ -1,7 +1,5 @@
 #pragma once
 
-#include <algorithm>
-#include <array>
 #include <atomic>
 #include <cstdint>
 #include <functional>
@@ -19,18 +17,6 @@ class Counter {
   std::atomic<std::uint64_t> value_{0};  // relaxed: no other memory is published through it
 };
 
-// Whether a counter of that name counts what was not delivered. The names are for people: "dropped:
-// disk full", "events lost by the tracer".
-[[nodiscard]] inline bool isLoss(std::string_view counterName) {
-  constexpr std::array<std::string_view, 13> kWords{
-      "dropped",   "suppressed",       "refused",   "discarded",    "failed",
-      "lost",      "skipped",          "given up",  "not recorded", "timed out",
-      "malformed", "not acknowledged", "unfinished"};
-  return std::ranges::any_of(kWords, [&](std::string_view word) {
-    return counterName.find(word) != std::string_view::npos;
-  });
-}
-
 // Counts what the pieces of the service, such as "session", received, delivered, suppressed and
 // dropped, by reason. For each piece, received = delivered + suppressed + dropped. If the sums
 // differ, something was lost and not counted.
@@ -43,7 +29,8 @@ class StatisticsService {
   // The counter of that piece and name, such as ("session", "suppressed: redundant"). The first
   // call makes it, and it lives as long as the service. Callers look a counter up once and keep the
   // reference, because a look-up takes a lock and compares names. They do not keep it in a static
-  // variable, which would outlive the service.
+  // variable, which would outlive the service. The kind of each name is in
+  // counter_kinds.cpp.
   virtual Counter& counter(std::string_view piece, std::string_view name) = 0;
 
   // Calls `callback` for each counter, in the order of piece and name, before it returns. Each

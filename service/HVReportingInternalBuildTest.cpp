@@ -1,4 +1,7 @@
+#include <string_view>
+
 #include "backends/HVReportingUtility.h"
+#include "platform/counter_kinds.h"
 #include "service/ServiceFixture.h"
 
 namespace halvox {
@@ -51,6 +54,21 @@ class HVReportingInternalBuildTest : public ServiceFixture {
 TEST_F(HVReportingInternalBuildTest, TheDelegateMakesOneStateManager) {
   ASSERT_NE(delegate_->vekStateManager(), nullptr);
   EXPECT_EQ(delegate_->vekStateManager()->leakedHapticsSessionCounter(), 0U);
+}
+
+// Losses are recorded and shown by the kinds of their counters. A counter whose name has no kind
+// would never be one. An internal build has all counters of the inner ring.
+TEST_F(HVReportingInternalBuildTest, EveryCounterOfTheServiceHasAKind) {
+  reportToSeven(30);
+
+  int counters = 0;
+  platform_.statistics.forEachCounter(
+      [&](std::string_view piece, std::string_view name, std::uint64_t) {
+        ++counters;
+        EXPECT_TRUE(platform::counterKind(name).has_value())
+            << piece << ", " << name << ": add the name to platform/counter_kinds.cpp";
+      });
+  EXPECT_GT(counters, 30);
 }
 
 TEST_F(HVReportingInternalBuildTest, LeakIsCountedAfterThePowerLogBeforeTheSession) {

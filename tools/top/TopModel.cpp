@@ -4,7 +4,7 @@
 #include <cmath>
 #include <utility>
 
-#include "platform/statistics.h"
+#include "platform/counter_kinds.h"
 
 namespace halvox::tools {
 namespace {

@@ -3,9 +3,11 @@
 #include <string_view>
 #include <utility>
 
+#include "platform/counter_kinds.h"
 #include "platform/linux/store/RecordTables.h"
 
 namespace halvox::platform::linux_ {
+
 LossRecords::LossRecords(StatisticsService& statistics, const ClockService& clock)
     : statistics_(statistics),
       clock_(clock),
