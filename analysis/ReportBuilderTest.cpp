@@ -228,6 +228,23 @@ TEST(ReportBuilderTest, TheWorstXrunsAreKeptAndTheOthersCounted) {
   EXPECT_EQ(lossOf(data, "xruns"), 3U + 1U);
 }
 
+TEST(ReportBuilderTest, ContentsOfMessagesAroundXrunsAreBounded) {
+  RecordSeries series;
+  series.at(1'000'000);
+  start(series, kPlayer);
+  for (const int milliseconds : {100, 300, 200}) {
+    xrun(series, kPlayer, milliseconds, R"(,"filler":")" + std::string(900, 'x') + "\"");
+  }
+
+  const ReportData data = reportOf(series, {.around = 0, .aroundBytes = 2500});
+
+  // The contents of two of them fit.
+  EXPECT_TRUE(data.xruns[0].around.empty());
+  EXPECT_FALSE(data.xruns[1].around.empty());
+  EXPECT_FALSE(data.xruns[2].around.empty());
+  EXPECT_EQ(lossOf(data, "xruns"), 1U);
+}
+
 TEST(ReportBuilderTest, StreamsThatLostMostAreKept) {
   RecordSeries series;
   series.at(1'000'000);

@@ -23,9 +23,11 @@ struct ReportBounds {
   std::size_t xruns = 2000;    // those that lost most
   std::size_t contexts = 200;  // xruns with the messages around them
   std::size_t around = 10;     // messages before and after an xrun
-  std::size_t marks = 500;     // changed settings and captures
-  std::size_t rows = 500;      // of each table of sums
-  std::size_t changes = 200;   // of a stream's volume, and of its formats and routes
+  // Of the contents of all those messages, which would otherwise be most of a page.
+  std::size_t aroundBytes = 1'500'000;
+  std::size_t marks = 500;    // changed settings and captures
+  std::size_t rows = 500;     // of each table of sums
+  std::size_t changes = 200;  // of a stream's volume, and of its formats and routes
   // Of all streams together. If they have more, each keeps an equal share, evenly chosen.
   std::size_t allChanges = 20'000;
   std::size_t volumes = 8;     // of the volumes at which a stream ran, with their times

@@ -1,6 +1,7 @@
 #include "analysis/XrunList.h"
 
 #include <algorithm>
+#include <unordered_set>
 
 namespace halvox::analysis {
 
@@ -48,7 +49,21 @@ ReportXrun* XrunList::find(std::int64_t messageID) {
   return found == xruns_.end() ? nullptr : &found->second;
 }
 
+void XrunList::limitContexts() {
+  std::unordered_set<std::int64_t> counted;
+  std::size_t bytes = 0;
+  std::for_each(contexts_.rbegin(), contexts_.rend(), [&](const Rank& rank) {
+    ReportXrun* const xrun = find(-rank.second);
+    if (xrun == nullptr) return;
+    for (const auto& message : xrun->around) {
+      if (counted.insert(message->id).second) bytes += message->payload.size();
+    }
+    if (bytes > bounds_.aroundBytes) xrun->around.clear();
+  });
+}
+
 std::vector<ReportXrun> XrunList::take() {
+  limitContexts();
   std::vector<ReportXrun> list;
   list.reserve(xruns_.size());
   for (auto& [messageID, xrun] : xruns_) {

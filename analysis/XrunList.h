@@ -40,6 +40,8 @@ class XrunList {
     return {xrun.milliseconds, -xrun.messageID};
   }
   void dropContext();
+  // Keeps the messages around the worst xruns, up to the bound of their contents.
+  void limitContexts();
 
   const ReportBounds& bounds_;
   std::deque<std::shared_ptr<const ReportMessage>> newest_;
