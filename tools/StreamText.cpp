@@ -216,14 +216,14 @@ std::vector<TextTable::Column> streamColumns() {
   return {{.heading = "ID", .align = Align::kRight},
           {.heading = "STARTED", .least = kUpToSeconds},
           {.heading = "APP", .least = 8},
-          {.heading = "SERVICE", .least = 8, .rank = 3},
-          {.heading = "DIRECTION", .rank = 2},
-          {.heading = "DEVICE", .least = 8},
-          {.heading = "RAN", .align = Align::kRight},
-          {.heading = "VOLUME", .least = 10, .rank = 1},
-          {.heading = "FORMAT", .least = 12, .rank = 4},
-          {.heading = "XRUNS"},
-          {.heading = "END"}};
+          {.heading = "SERVICE", .least = 8, .rank = 7},
+          {.heading = "DIRECTION", .rank = 6},
+          {.heading = "DEVICE", .least = 8, .rank = 3},
+          {.heading = "RAN", .align = Align::kRight, .rank = 1},
+          {.heading = "VOLUME", .least = 10, .rank = 5},
+          {.heading = "FORMAT", .least = 12, .rank = 8},
+          {.heading = "XRUNS", .rank = 2},
+          {.heading = "END", .rank = 4}};
 }
 
 std::vector<std::string> streamRow(const StreamStory& story) {

@@ -114,7 +114,10 @@ ExitStatus showStreams(const ShowStreams& request, OutputForm form, std::ostream
     for (const auto& [started, story] : stories) out << streamJson(story) << '\n';
   } else {
     TextTable table(streamColumns());
-    for (const auto& [started, story] : stories) table.add(streamRow(story));
+    // The table holds its rows: each story goes when it has become one.
+    for (auto next = stories.begin(); next != stories.end(); next = stories.erase(next)) {
+      table.add(streamRow(next->second));
+    }
     table.print(out, terminalWidth(outputDescriptor));
   }
   out << std::flush;

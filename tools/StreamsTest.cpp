@@ -1,12 +1,15 @@
 #include "tools/Streams.h"
 
 #include <algorithm>
+#include <sstream>
+#include <string>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "tools/StoredEventsFixture.h"
 #include "tools/StreamText.h"
+#include "tools/TextTable.h"
 
 namespace halvox::tools {
 namespace {
@@ -42,6 +45,23 @@ TEST_F(StreamsTest, ListsStreams) {
   EXPECT_THAT(out_.str(), HasSubstr("player"));
   EXPECT_THAT(out_.str(), HasSubstr("playback"));
   EXPECT_THAT(out_.str(), HasSubstr("1.0s"));
+}
+
+TEST_F(StreamsTest, ANarrowTerminalHasTheStartTheApplicationAndTheXruns) {
+  constexpr std::size_t kWidth = 40;
+  StreamStory story;
+  story.id = 1'204'000;
+  story.application = "org.example.player-with-a-long-name";
+  story.xruns.reports = 3;
+  TextTable table(streamColumns());
+  table.add(streamRow(story));
+
+  table.print(out_, kWidth);
+
+  EXPECT_THAT(out_.str(), HasSubstr("STARTED"));
+  EXPECT_THAT(out_.str(), HasSubstr("org.ex"));
+  std::istringstream lines(out_.str());
+  for (std::string line; std::getline(lines, line);) EXPECT_LE(displayWidth(line), kWidth) << line;
 }
 
 TEST_F(StreamsTest, SelectsByApplication) {

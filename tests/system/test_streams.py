@@ -205,7 +205,7 @@ class StreamsTest(unittest.TestCase):
         self.wait_for_ends(1)
         whole = self.ctl("streams").stdout
         self.assertIn("of which not all fits", whole)
-        for width in (80, 120, 160):
+        for width in (40, 80, 120, 160):
             lines = self.at_terminal(width, "streams")
             self.assertEqual(len(lines), 2)
             for line in lines:
