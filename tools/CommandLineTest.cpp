@@ -433,6 +433,7 @@ TEST(CommandLineTest, ExportTakesKindsAndApplications) {
   EXPECT_TRUE(some.kinds.link);
   EXPECT_EQ(some.applications, (Words{"a*", "b"}));
   EXPECT_TRUE(asked({"export", "--format", "csv"}).kinds.snapshots);
+  EXPECT_TRUE(asked({"export", "--format", "csv"}).kinds.losses);
   EXPECT_NE(errorOf({"export", "--kind", "event", "-o", "f"}).find("expected one of events, "),
             std::string::npos);
 }

@@ -30,6 +30,7 @@
 #include "tools/export/JsonlWriter.h"
 #include "tools/export/OtlpWriter.h"
 #include "tools/export/PerfettoIntervals.h"
+#include "tools/export/PerfettoLosses.h"
 #include "tools/export/PerfettoStreams.h"
 #include "tools/export/PerfettoTrace.h"
 
@@ -148,6 +149,7 @@ class Export {
         [&](const analysis::StreamStory& story, const analysis::StreamMoment& moment) {
           shown.onMoment(story, moment);
         });
+    PerfettoLosses losses(trace);
     trace.begin(PerfettoTrace::timeOf(request_.since.value_or(now())));
     Result<void> written;
     analysis::StoreRecordSource source(reader_);
@@ -155,12 +157,14 @@ class Export {
     const auto onRecord = [&](const analysis::Record& record) {
       progress_.onRecord(record.time);
       builder.add(record);
+      if (isWantedLoss(record)) losses.add(record);
       if (text.size() < kBytesPerWrite) return;
       written = output->write(text);
       text.clear();
       if (!written) reader_.stopReading();
     };
-    const auto read = source.forEach({.since = std::nullopt, .until = request_.until}, onRecord);
+    const auto read =
+        source.forEach({.since = std::nullopt, .until = request_.until, .losses = true}, onRecord);
     if (!written) return cannotWrite(written);
     if (!read) return ExportFailure{ExitStatus::kNoService, read.error().message};
     // What came after the period is not known.
@@ -173,6 +177,11 @@ class Export {
     written = output->write(text);
     if (written) written = output->finish();
     return cannotWrite(written);
+  }
+
+  // Losses belong to no application.
+  [[nodiscard]] bool isWantedLoss(const analysis::Record& record) const {
+    return request_.applications.empty() && (!request_.since || record.time >= *request_.since);
   }
 
   // Adds the newest results of a trace, if they are of the time that was asked for. They belong to

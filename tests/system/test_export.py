@@ -26,6 +26,7 @@ TABLES = {
     "link": ("link_messages", ("time", "session_id", "client_name", "service_name", "category",
                                "type", "payload")),
     "snapshots": ("snapshots", ("time", "signature", "path")),
+    "losses": ("losses", ("time", "piece", "reason", "count")),
 }
 # What must survive: numbers at their limits, texts of any characters, nesting.
 HOSTILE = {"large": 2**63 - 1, "small": -2**63, "fraction": 0.1, "whole": 1.0, "none": {},

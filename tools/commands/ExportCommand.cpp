@@ -23,8 +23,8 @@ constexpr std::array<std::pair<std::string_view, ExportFormat>, 5> kFormats{
      {"csv", ExportFormat::kCsv},
      {"otlp-json", ExportFormat::kOtlpJson},
      {"perfetto", ExportFormat::kPerfetto}}};
-constexpr std::array kKinds{ExportKind::kEvents, ExportKind::kMetrics, ExportKind::kPower,
-                            ExportKind::kLink, ExportKind::kSnapshots};
+constexpr std::array kKinds{ExportKind::kEvents, ExportKind::kMetrics,   ExportKind::kPower,
+                            ExportKind::kLink,   ExportKind::kSnapshots, ExportKind::kLosses};
 
 Result<ExportFormat> parseFormat(std::string_view text) {
   std::string names;
@@ -54,7 +54,8 @@ ExportKinds kindsOf(const std::vector<ExportKind>& asked) {
           .metrics = has(ExportKind::kMetrics),
           .power = has(ExportKind::kPower),
           .link = has(ExportKind::kLink),
-          .snapshots = has(ExportKind::kSnapshots)};
+          .snapshots = has(ExportKind::kSnapshots),
+          .losses = has(ExportKind::kLosses)};
 }
 
 ExportRecords checked(ExportRecords request, const std::vector<ExportKind>& kinds) {
@@ -85,7 +86,7 @@ void addExportCommand(CommandSet& commands) {
        .details = "A file gets its name when it is complete. docs/export.md describes the formats.",
        .reach = CommandReach::kFiles});
   addParsed(app, "--format", request->format, parseFormat,
-            "sqlite: a database with five plain tables (default); jsonl: one JSON object a line; "
+            "sqlite: a database with six plain tables (default); jsonl: one JSON object a line; "
             "csv: one table for spreadsheets; otlp-json: log records of OpenTelemetry, one request "
             "a line; perfetto: a trace of the streams for Perfetto's viewer")
       ->type_name("FORMAT");
@@ -94,7 +95,7 @@ void addExportCommand(CommandSet& commands) {
       ->type_name("FILE");
   app.add_flag("--force", request->replace, "Replace the file if it exists");
   addEach(app, "--kind", *kinds, parseKind,
-          "Only records of this kind: events, metrics, power, link or snapshots")
+          "Only records of this kind: events, metrics, power, link, snapshots or losses")
       ->type_name("KIND");
   app.add_option("--app", request->applications,
                  "Only records of applications that match this glob pattern; may be given several "

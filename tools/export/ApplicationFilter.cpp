@@ -35,6 +35,7 @@ bool ApplicationFilter::accepts(const StoredItem& item) {
       return issue && matches(issue->client);
     }
     case ExportKind::kSnapshots:
+    case ExportKind::kLosses:
       return false;
   }
   return false;

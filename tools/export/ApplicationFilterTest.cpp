@@ -67,6 +67,7 @@ TEST(ApplicationFilterTest, OtherRecordsNameTheirApplicationOrHaveNone) {
                                 "com.a")));
   EXPECT_FALSE(filter.accepts(metricItem("\xFF")));
   EXPECT_FALSE(filter.accepts(snapshotItem("{}")));
+  EXPECT_FALSE(filter.accepts(lossItem("dropped: disk full")));
 }
 
 }  // namespace

@@ -18,7 +18,7 @@ using platform::linux_::StoredItem;
 
 constexpr std::string_view kHeader =
     "kind,id,time,time_utc,application,name,session_id,client_name,service_name,category,type,"
-    "metric_id,payload,path";
+    "metric_id,payload,path,reason,count";
 constexpr std::string_view kLineEnd = "\r\n";
 
 // What spreadsheets take for the beginning of a formula. Some skip a tab or a line break first, and
@@ -81,6 +81,8 @@ class CsvWriter final : public RecordWriter {
     };
     const bool isLink = kind == ExportKind::kLink;
     const bool isMetric = kind == ExportKind::kMetrics;
+    const bool isLoss = kind == ExportKind::kLosses;
+    const std::string_view payload = isLoss ? std::string_view() : item.payload;
     Line line(text);
     line.plain(wordOf(kind)).number(item.id).plain(timeNumber(item.time));
     line.plain(utcTime(item.time)).name(item.application).name(item.name);
@@ -88,8 +90,9 @@ class CsvWriter final : public RecordWriter {
     line.number(only(isLink || kind == ExportKind::kPower, item.number));
     line.number(only(isLink, item.type)).number(only(isMetric, item.number));
     // A damaged payload need not begin with a brace.
-    isMetric ? line.plain(hexadecimal(item.payload)) : line.name(item.payload);
-    line.name(item.path).end();
+    isMetric ? line.plain(hexadecimal(payload)) : line.name(payload);
+    line.name(item.path).name(isLoss ? item.payload : std::string_view());
+    line.number(only(isLoss, item.number)).end();
   }
 };
 

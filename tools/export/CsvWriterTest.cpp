@@ -11,7 +11,7 @@ using platform::linux_::StoredItem;
 
 constexpr std::string_view kHeader =
     "kind,id,time,time_utc,application,name,session_id,client_name,service_name,category,type,"
-    "metric_id,payload,path\r\n";
+    "metric_id,payload,path,reason,count\r\n";
 
 // The lines after the header.
 template <typename... Items>
@@ -32,17 +32,20 @@ TEST(CsvWriterTest, AHeaderNamesTheColumns) { EXPECT_EQ(linesOf(), ""); }
 TEST(CsvWriterTest, EachKindFillsItsColumns) {
   EXPECT_EQ(linesOf(eventItem("{}", "org.player")),
             "events,8,1700000000.25,2023-11-14T22:13:20.250Z,org.player,"
-            "com.tarno.halvox.Session_Playback.Start,,,,,,,{},\r\n");
+            "com.tarno.halvox.Session_Playback.Start,,,,,,,{},,,\r\n");
   EXPECT_EQ(linesOf(linkItem("{}")),
             "link,9,1700000001,2023-11-14T22:13:21.000Z,,,-1,com.tarno.halvox,"
-            "longformaudio_session,4,1,,{},\r\n");
+            "longformaudio_session,4,1,,{},,,\r\n");
   EXPECT_EQ(linesOf(metricItem("\x01\xFF")),
-            "metrics,3,1700000002,2023-11-14T22:13:22.000Z,,,,,,,,5963779,01ff,\r\n");
+            "metrics,3,1700000002,2023-11-14T22:13:22.000Z,,,,,,,,5963779,01ff,,,\r\n");
   EXPECT_EQ(linesOf(powerItem("{}")),
-            "power,4,1700000003,2023-11-14T22:13:23.000Z,,Oxbow_Haptics,,,,28,,,{},\r\n");
+            "power,4,1700000003,2023-11-14T22:13:23.000Z,,Oxbow_Haptics,,,,28,,,{},,,\r\n");
   EXPECT_EQ(linesOf(snapshotItem("{}")),
             "snapshots,5,1700000004,2023-11-14T22:13:24.000Z,,,,,,,,,{},"
-            "\"/var/lib/halvox/a, b.tar\"\r\n");
+            "\"/var/lib/halvox/a, b.tar\",,\r\n");
+  EXPECT_EQ(linesOf(lossItem("dropped: disk full")),
+            "losses,6,1700000005,2023-11-14T22:13:25.000Z,,link local,,,,,,,,,dropped: disk full,12"
+            "\r\n");
 }
 
 TEST(CsvWriterTest, FieldsWithCommasQuotesAndLineBreaksAreQuoted) {

@@ -69,6 +69,10 @@ class JsonlWriter final : public RecordWriter {
       case ExportKind::kSnapshots:
         addJson(writer, "signature", item.payload);
         return addText(writer, "path", item.path);
+      case ExportKind::kLosses:
+        addText(writer, "piece", item.name);
+        addText(writer, "reason", item.payload);
+        return addNumber(writer, "count", item.number);
     }
   }
 

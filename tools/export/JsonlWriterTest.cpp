@@ -29,6 +29,9 @@ TEST(JsonlWriterTest, EveryKindHasTheColumnsOfItsTable) {
   EXPECT_EQ(lineOf(snapshotItem("{}")),
             "{\"kind\":\"snapshots\",\"id\":5,\"time\":1700000004,\"signature\":{},"
             "\"path\":\"/var/lib/halvox/a, b.tar\"}\n");
+  EXPECT_EQ(lineOf(lossItem("dropped: disk full")),
+            "{\"kind\":\"losses\",\"id\":6,\"time\":1700000005,\"piece\":\"link local\","
+            "\"reason\":\"dropped: disk full\",\"count\":12}\n");
 }
 
 TEST(JsonlWriterTest, NoDigitOfAPayloadIsLost) {

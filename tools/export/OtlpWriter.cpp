@@ -112,8 +112,9 @@ class OtlpWriter final : public RecordWriter {
 
   void writeRecord(const StoredItem& item) {
     const ExportKind kind = kindOf(item);
-    // The bytes of a metric are not JSON.
-    payload_.show(kind == ExportKind::kMetrics ? std::string_view() : item.payload);
+    // The bytes of a metric and the reason of a loss are not JSON.
+    const bool hasJson = kind != ExportKind::kMetrics && kind != ExportKind::kLosses;
+    payload_.show(hasJson ? item.payload : std::string_view());
     const Severity severity = severityOf(kind, item);
     writer_.StartObject();
     addText("timeUnixNano", unixNano(payload_.number(kStampKey).value_or(item.time)));
@@ -121,11 +122,16 @@ class OtlpWriter final : public RecordWriter {
     writeKey(writer_, "severityNumber");
     writer_.Int(severity.number);
     addText("severityText", severity.text);
-    if (!item.name.empty()) addText("eventName", item.name);
+    // The name of a loss is that of the piece of the service that counted it.
+    if (!item.name.empty() && kind != ExportKind::kLosses) addText("eventName", item.name);
     writeKey(writer_, "body");
     if (kind == ExportKind::kMetrics) {
       writer_.StartObject();
       addText("bytesValue", base64(item.payload));
+      writer_.EndObject();
+    } else if (kind == ExportKind::kLosses) {
+      writer_.StartObject();
+      addText("stringValue", item.payload);
       writer_.EndObject();
     } else {
       writeOtlpValue(writer_, item.payload);
@@ -139,6 +145,7 @@ class OtlpWriter final : public RecordWriter {
   // What a collector's rules usually ask for first.
   Severity severityOf(ExportKind kind, const StoredItem& item) const {
     std::string_view type;
+    if (kind == ExportKind::kLosses) return kWarning;
     if (kind == ExportKind::kMetrics) {
       return item.number == analysis::kAudioIssueDetected ? kWarning : kInfo;
     }
@@ -174,6 +181,10 @@ class OtlpWriter final : public RecordWriter {
       }
       case ExportKind::kSnapshots:
         addAttribute("halvox.snapshot.path", item.path);
+        break;
+      case ExportKind::kLosses:
+        addAttribute("halvox.loss.piece", item.name);
+        addAttribute("halvox.loss.count", item.number);
         break;
     }
   }

@@ -86,6 +86,16 @@ TEST(OtlpWriterTest, OtherKindsHaveTheirAttributesAndBody) {
   }
 }
 
+TEST(OtlpWriterTest, ALossIsAWarningAboutAPieceOfTheService) {
+  const std::string loss = requestOf(lossItem("dropped: disk full"));
+  EXPECT_THAT(loss,
+              HasSubstr(R"("severityText":"WARN","body":{"stringValue":"dropped: disk full"})"));
+  EXPECT_THAT(loss, HasSubstr(R"({"key":"halvox.kind","value":{"stringValue":"losses"}})"));
+  EXPECT_THAT(loss,
+              HasSubstr(R"({"key":"halvox.loss.piece","value":{"stringValue":"link local"}})"));
+  EXPECT_THAT(loss, HasSubstr(R"({"key":"halvox.loss.count","value":{"intValue":"12"}})"));
+}
+
 TEST(OtlpWriterTest, IssuesAreWarningsAndErrorsAreErrors) {
   StoredItem item = eventItem("{}");
   item.name = "com.tarno.halvox.Session_Playback.IssueDetector";

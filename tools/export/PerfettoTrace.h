@@ -24,7 +24,13 @@ class PerfettoTrace {
 
   // A track belongs to the process or to the track that is its parent.
   enum class TrackID : std::uint64_t {};
-  enum class TrackKind : std::uint8_t { kProcess = 1, kStream = 2, kVolume = 3, kInterval = 4 };
+  enum class TrackKind : std::uint8_t {
+    kProcess = 1,
+    kStream = 2,
+    kVolume = 3,
+    kInterval = 4,
+    kLoss = 5
+  };
   // Unique in the trace. Only the low 60 bits of the number count.
   [[nodiscard]] static TrackID track(TrackKind kind, std::int64_t number);
 

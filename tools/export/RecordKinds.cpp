@@ -17,6 +17,8 @@ bool ExportKinds::has(ExportKind kind) const {
       return link;
     case ExportKind::kSnapshots:
       return snapshots;
+    case ExportKind::kLosses:
+      return losses;
   }
   return false;
 }
@@ -25,6 +27,7 @@ ExportKind kindOf(const StoredItem& item) {
   if (item.table == nullptr) return ExportKind::kEvents;
   if (item.table == &store::kIssueMetrics) return ExportKind::kMetrics;
   if (item.table == &store::kPowerEvents) return ExportKind::kPower;
+  if (item.table == &store::kLosses) return ExportKind::kLosses;
   return item.table == &store::kLinkMessages ? ExportKind::kLink : ExportKind::kSnapshots;
 }
 
@@ -40,6 +43,8 @@ std::string_view wordOf(ExportKind kind) {
       return "link";
     case ExportKind::kSnapshots:
       return "snapshots";
+    case ExportKind::kLosses:
+      return "losses";
   }
   return {};
 }
@@ -49,7 +54,8 @@ store::StoredKinds storedKinds(const ExportKinds& kinds) {
   return {.messages = kinds.events || kinds.link,
           .metrics = kinds.metrics,
           .power = kinds.power,
-          .snapshots = kinds.snapshots};
+          .snapshots = kinds.snapshots,
+          .losses = kinds.losses};
 }
 
 }  // namespace halvox::tools

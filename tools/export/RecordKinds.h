@@ -8,7 +8,7 @@
 namespace halvox::tools {
 
 // The kinds of records, in the order of the words below.
-enum class ExportKind : std::uint8_t { kEvents, kMetrics, kPower, kLink, kSnapshots };
+enum class ExportKind : std::uint8_t { kEvents, kMetrics, kPower, kLink, kSnapshots, kLosses };
 
 // The kinds that an export has.
 struct ExportKinds {
@@ -17,6 +17,7 @@ struct ExportKinds {
   bool power = true;
   bool link = true;
   bool snapshots = true;
+  bool losses = true;
 
   [[nodiscard]] bool has(ExportKind kind) const;
 };

@@ -66,6 +66,17 @@ namespace halvox::tools {
   return item;
 }
 
+[[nodiscard]] inline platform::linux_::StoredItem lossItem(std::string_view reason) {
+  platform::linux_::StoredItem item;
+  item.table = &platform::linux_::kLosses;
+  item.id = 6;
+  item.time = 1'700'000'005;
+  item.name = "link local";
+  item.payload = reason;
+  item.number = 12;
+  return item;
+}
+
 // The whole text of an export of these records.
 template <typename... Items>
 std::string written(RecordWriter& writer, const Items&... items) {

@@ -16,12 +16,13 @@ namespace halvox::platform::linux_ {
 namespace {
 
 // The names of the tables of an export, and the kinds of their records. null: the events.
-constexpr std::array<std::pair<std::string_view, const RecordTable*>, 5> kKinds{
+constexpr std::array<std::pair<std::string_view, const RecordTable*>, 6> kKinds{
     {{"analytics_events", nullptr},
      {"issue_metrics", &kIssueMetrics},
      {"power_events", &kPowerEvents},
      {"link_messages", &kLinkMessages},
-     {"snapshots", &kSnapshots}}};
+     {"snapshots", &kSnapshots},
+     {"losses", &kLosses}}};
 
 constexpr std::array kEventColumns{RecordColumn{"name", ColumnType::kText},
                                    RecordColumn{"payload", ColumnType::kText}};
@@ -64,6 +65,10 @@ void bindColumns(Statement& statement, const StoredItem& item) {
     statement.bind(5, item.number);
     statement.bind(6, item.type);
     statement.bind(7, notNull(item.payload));
+  } else if (item.table == &kLosses) {
+    statement.bind(2, notNull(item.name));
+    statement.bind(3, notNull(item.payload));
+    statement.bind(4, item.number);
   } else {
     statement.bind(2, notNull(item.payload));
     statement.bind(3, notNull(item.path));

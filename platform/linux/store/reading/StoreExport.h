@@ -11,7 +11,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Writes a database in which the five views of a store are plain tables with the same columns. Any
+// Writes a database in which the six views of a store are plain tables with the same columns. Any
 // program that can read SQLite can read this database without the store's extension.
 //
 //   create(); add() each record; finish()

@@ -43,7 +43,8 @@ class StoreExportTest : public StoreFixture {
     StoreExport exported(file);
     auto done = exported.create();
     if (!done) return done;
-    const StoredKinds all{.messages = true, .metrics = true, .power = true, .snapshots = true};
+    const StoredKinds all{
+        .messages = true, .metrics = true, .power = true, .snapshots = true, .losses = true};
     EXPECT_TRUE(reader.forEachItem(
         all, filter, [&](const StoredItem& item) { EXPECT_TRUE(exported.add(item)); }));
     done = exported.finish();
@@ -84,6 +85,17 @@ TEST_F(StoreExportTest, WritesTheRecordsOfARangeOfTime) {
     EXPECT_EQ(plainValue("SELECT count(*) || ' ' || min(time) FROM " + name), "1 1700000002.0")
         << name;
   }
+}
+
+TEST_F(StoreExportTest, WritesWhatTheServiceLost) {
+  start();
+  platform.statistics.counter("session", "dropped: a").add(5);
+  stop();
+
+  ASSERT_TRUE(exportTo(file(), {}));
+
+  EXPECT_EQ(rows(file(), "SELECT * FROM losses"),
+            std::vector<std::string>{"1700000000.0|session|dropped: a|5"});
 }
 
 TEST_F(StoreExportTest, LeavesNothingWhenItIsNotFinished) {
