@@ -338,6 +338,14 @@ std::string helpOf(Words words) {
   return text->text;
 }
 
+TEST(CommandLineTest, ACompareTakesTwoPeriods) {
+  EXPECT_EQ(errorOf({"report", "--compare", "yesterday", "today"}), "");
+  EXPECT_NE(errorOf({"report", "--compare", "yesterday"}), "");
+  EXPECT_NE(errorOf({"report", "--compare", "yesterday", "today", "today"}), "");
+  EXPECT_NE(helpOf({"report"}).find("--compare BEFORE AFTER "), std::string::npos);
+  EXPECT_EQ(helpOf({"report"}).find("x 2"), std::string::npos);
+}
+
 TEST(CommandLineTest, EveryCommandHasHelpWithAnExampleOfItself) {
   ASSERT_GT(allCommands().size(), 25U);
   for (const Words& words : allCommands()) {

@@ -206,6 +206,10 @@ Result<ComparedPeriod> parseComparedPeriod(std::string_view text, double now) {
   if (const auto since = parse(text.substr(0, range), period.since); !since) return since.error();
   const auto until = parse(text.substr(range + kRange.size()), period.until);
   if (!until) return until.error();
+  if (period.since && period.until && *period.until <= *period.since) {
+    return Failure<>{"\"" + std::string(text) +
+                     "\" ends before it begins; expected SINCE..UNTIL, the earlier time first"};
+  }
   if (!period.since && !period.until) {
     return Failure<>{"\"..\" is every time; give at least one of SINCE and UNTIL"};
   }

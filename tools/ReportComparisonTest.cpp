@@ -55,6 +55,11 @@ TEST(ComparedPeriodTest, APathIsAStore) {
   }
 }
 
+TEST(ComparedPeriodTest, APeriodThatEndsBeforeItBeginsIsRefused) {
+  EXPECT_THAT(errorOf("@200..@100"), HasSubstr("\"@200..@100\" ends before it begins"));
+  EXPECT_THAT(errorOf("@200..@200"), HasSubstr("ends before it begins"));
+}
+
 TEST(ComparedPeriodTest, WhatIsNeitherIsRefusedWithWhatIsExpected) {
   EXPECT_THAT(errorOf("tuesday"), HasSubstr("\"tuesday\" is not a period; expected a day"));
   EXPECT_THAT(errorOf("2h"), HasSubstr("is not a period"));

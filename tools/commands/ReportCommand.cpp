@@ -68,7 +68,9 @@ void addReportCommand(CommandSet& commands) {
                   "Compare AFTER with BEFORE. Each is a day (yesterday, 2026-11-21), SINCE..UNTIL "
                   "with times as below, or the path of a store (./before/halvox.db)")
       ->type_name("BEFORE AFTER")
-      ->expected(2);
+      // Two texts of one value. With expected(2), the help would say "BEFORE AFTER x 2".
+      ->type_size(2)
+      ->expected(1);
   addTimes(report, arguments->report.since, arguments->report.until, "records");
   addDatabase(report, arguments->report.database);
   commands.onRun(
