@@ -40,6 +40,8 @@ class AsioDispatchServiceTest : public DispatchFixture {
   }
 };
 
+// May count threads that have ended and been joined: the kernel removes a thread from the list a
+// little later. A later count can therefore be lower.
 std::size_t threadsOfThisProcess() {
   const std::filesystem::directory_iterator tasks("/proc/self/task");
   return static_cast<std::size_t>(std::distance(begin(tasks), end(tasks)));
@@ -106,7 +108,7 @@ TEST_F(AsioDispatchServiceTest, ThousandsOfDelaysCostNoThread) {
     service_->asyncAfterOnBackgroundQueue(std::chrono::hours(1), [] {});
   }
 
-  EXPECT_EQ(threadsOfThisProcess(), before);
+  EXPECT_LE(threadsOfThisProcess(), before);
 }
 
 TEST_F(AsioDispatchServiceTest, EarlierDelayOvertakesAPendingOne) {
@@ -148,7 +150,7 @@ TEST_F(AsioDispatchServiceTest, ThreadOfADroppedQueueEnds) {
     queue->async(JobWeight::kBrief, [] {});
   }
 
-  EXPECT_TRUE(eventually([before] { return threadsOfThisProcess() == before; }));
+  EXPECT_TRUE(eventually([before] { return threadsOfThisProcess() <= before; }));
 }
 
 TEST_F(AsioDispatchServiceTest, QueueMayBeDroppedByItsOwnJob) {
@@ -241,7 +243,7 @@ INSTANTIATE_TEST_SUITE_P(Queues, AsioDispatchFinishTest,
                          });
 
 TEST_P(AsioDispatchFinishTest, FinishWaitsAsLongAsJobsEnd) {
-  constexpr int kJobs = 8;
+  constexpr int kJobs = 16;
   const auto queue = createQueue(GetParam());
   std::promise<void> never;
   const std::shared_future<void> longJob = never.get_future().share();
@@ -253,10 +255,11 @@ TEST_P(AsioDispatchFinishTest, FinishWaitsAsLongAsJobsEnd) {
     });
   }
 
-  // All jobs together take longer than the limit for one of them.
-  EXPECT_EQ(
-      service_->finish({.withoutProgress = std::chrono::milliseconds(500), .total = kTestDeadline}),
-      0U);
+  // All jobs together take longer than the limit for one of them. The limit is many times as long
+  // as a job, because a busy machine delays single jobs.
+  EXPECT_EQ(service_->finish(
+                {.withoutProgress = std::chrono::milliseconds(1500), .total = kTestDeadline}),
+            0U);
 
   EXPECT_EQ(ran, kJobs);
   EXPECT_TRUE(service_->stop(kTestDeadline));
@@ -351,7 +354,7 @@ class AsioDispatchWaitTest : public AsioDispatchServiceTest {
 TEST_F(AsioDispatchWaitTest, ThousandWaitingQueuesCostNoThreadAndNoWakeUps) {
   const std::size_t before = threadsOfThisProcess();
   letQueuesWait(*service_, 1000, std::chrono::hours(1));
-  EXPECT_EQ(threadsOfThisProcess(), before);
+  EXPECT_LE(threadsOfThisProcess(), before);
 
   EXPECT_GT(wakeUps(), 0);
   EXPECT_TRUE(staysQuiet(wakeUps, std::chrono::milliseconds(200)));
