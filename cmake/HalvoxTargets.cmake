@@ -163,8 +163,9 @@ endfunction()
 add_custom_target(halvox_concurrent_tests)
 
 # halvox_test(<name> SOURCES <files> [DEPENDS <targets>] [LABELS <labels>])
-# A GoogleTest program. CTest lists its tests one by one. They have the label `unit` unless other
-# labels are given; tests with the label `concurrent` also run under ThreadSanitizer.
+# A GoogleTest program. CTest lists its tests one by one, or only the program in a build with a
+# sanitizer. They have the label `unit` unless other labels are given; tests with the label
+# `concurrent` also run under ThreadSanitizer.
 function(halvox_test name)
   cmake_parse_arguments(ARG "" "" "SOURCES;DEPENDS;LABELS" ${ARGN})
   if(NOT ARG_LABELS)
@@ -177,13 +178,19 @@ function(halvox_test name)
   if("concurrent" IN_LIST ARG_LABELS)
     add_dependencies(halvox_concurrent_tests ${name})
   endif()
-  include(GoogleTest)
-  # The discovery of tests keeps only the first label of a list. The labels therefore become one,
-  # which `ctest -L` finds by any of its parts: unit-concurrent.
+  # Labels become one, because the discovery of tests keeps only the first of a list. `ctest -L`
+  # finds it by any of its parts: unit-concurrent.
   string(REPLACE ";" "-" labels "${ARG_LABELS}")
-  gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST
-    PROPERTIES LABELS "${labels}" TIMEOUT ${HALVOX_UNIT_TEST_SECONDS}
-      PROCESSORS ${HALVOX_BUSY_TEST_SLOTS})
+  set(properties LABELS "${labels}" TIMEOUT ${HALVOX_UNIT_TEST_SECONDS}
+    PROCESSORS ${HALVOX_BUSY_TEST_SLOTS})
+  if(HALVOX_SANITIZE)
+    # A sanitized program takes a tenth of a second to start, which is longer than most tests.
+    add_test(NAME ${name} COMMAND ${name} --gtest_brief=1)
+    set_tests_properties(${name} PROPERTIES ${properties})
+  else()
+    include(GoogleTest)
+    gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES ${properties})
+  endif()
 endfunction()
 
 # halvox_fuzzer(<name> SOURCES <files> [DEPENDS <targets>])
