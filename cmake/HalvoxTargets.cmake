@@ -6,9 +6,11 @@ if(HALVOX_CCACHE)
   set(CMAKE_CXX_COMPILER_LAUNCHER ${HALVOX_CCACHE})
 endif()
 
+# Packages switch this off: a compiler or hardening options that we do not build with warn of more.
+option(HALVOX_WERROR "Treat warnings as errors" ON)
 add_library(halvox_flags INTERFACE)
 target_compile_options(halvox_flags INTERFACE
-  -Werror -Wall -Wextra -Wshadow
+  $<$<BOOL:${HALVOX_WERROR}>:-Werror> -Wall -Wextra -Wshadow
   $<$<COMPILE_LANGUAGE:CXX>:-Wconversion -Wnon-virtual-dtor>
   $<$<AND:$<COMPILE_LANGUAGE:CXX>,$<CXX_COMPILER_ID:Clang>>:-Wthread-safety>)
 # GCC 12 reports overruns inside its own std::string when it optimises. clang and the sanitizers
