@@ -7,12 +7,13 @@
 namespace halvox::analysis {
 
 void BucketCounts::add(double lower, double upper, std::uint64_t hits) {
+  hits = std::min(hits, kMostHits - count_);
   if (hits == 0) return;
   const auto bounds = std::make_pair(lower, upper);
   auto found = buckets_.find(bounds);
   if (found == buckets_.end()) {
     if (buckets_.size() >= kMostBuckets) {
-      notKept_ += hits;
+      notKept_ = std::min(kMostHits, notKept_ + hits);
       return;
     }
     found = buckets_.emplace(bounds, 0).first;

@@ -15,6 +15,9 @@ class BucketCounts {
  public:
   // More distinct bounds than this are counted in notKept(): the bounds come from clients.
   static constexpr std::size_t kMostBuckets = 128;
+  // Further hits are ignored: a client can report any number, and the sum must not overflow. A
+  // double holds every number up to this one.
+  static constexpr std::uint64_t kMostHits = std::uint64_t{1} << 53U;
 
   struct Bucket {
     double lower = 0;

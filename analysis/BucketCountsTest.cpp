@@ -65,6 +65,17 @@ TEST(BucketCountsTest, ValuesAreCountedBetweenPowersOfTwo) {
   EXPECT_EQ(buckets[2].upper, 16);
 }
 
+TEST(BucketCountsTest, HitsOfAnyNumberDoNotOverflow) {
+  constexpr auto kMany = static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max());
+  BucketCounts counts;
+
+  counts.add(0, 10, 5);
+  for (int time = 0; time < 3; ++time) counts.add(10, 20, kMany);
+
+  EXPECT_EQ(counts.count(), BucketCounts::kMostHits);
+  EXPECT_EQ(counts.percentile(0.5), 20);
+}
+
 TEST(BucketCountsTest, TooManyBoundsAreCountedAndNotKept) {
   BucketCounts counts;
 
