@@ -338,6 +338,11 @@ std::string helpOf(Words words) {
   return text->text;
 }
 
+TEST(CommandLineTest, EventsOfASessionAreNotFollowed) {
+  EXPECT_EQ(errorOf({"events", "--session", "7"}), "");
+  EXPECT_NE(errorOf({"events", "--session", "7", "--follow"}), "");
+}
+
 TEST(CommandLineTest, ACompareTakesTwoPeriods) {
   EXPECT_EQ(errorOf({"report", "--compare", "yesterday", "today"}), "");
   EXPECT_NE(errorOf({"report", "--compare", "yesterday"}), "");

@@ -24,6 +24,9 @@ struct ShowEvents {
   std::vector<std::string> applications{};  // glob patterns
   std::vector<std::uint32_t> categories{};  // one without a domain stands for all domains
   std::vector<std::uint16_t> types{};
+  // Events of messages that the link recorded for one of these sessions. Not together with
+  // following: the link records a message later than the events do.
+  std::vector<std::int64_t> sessions{};
   // JSON has everything. Text has by default only one of the two events of a message (EventRows),
   // and no events about connections of halvoxctl itself, each of whose commands would add one.
   bool hasAllNames = false;

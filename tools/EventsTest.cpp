@@ -60,6 +60,29 @@ TEST_F(EventsTest, ShowsEventsNewestLast) {
   EXPECT_EQ(shown({}), "1234");
 }
 
+TEST_F(EventsTest, ChoosesBySessionOfTheLinkMessage) {
+  for (int number = 1; number <= 4; ++number) {
+    const platform::Dictionary message{{"n", number}, {"hvreporting_timestamp", 99.5 + number}};
+    store("com.tarno.halvox.Session_Playback.State", message);
+    store("com.tarno.music.Session_Playback.State", message);
+    // The fourth is a message that the link did not store.
+    if (number < 4) storeLink(number % 2 == 1 ? 7 : 8, message);
+  }
+  store("com.tarno.halvox.other", {{"n", 5}});
+  const auto select = [this](ShowEvents request) {
+    request.selection.database = directory();
+    return shownBy(request);
+  };
+
+  EXPECT_EQ(select({.sessions = {7}}), "13");
+  EXPECT_EQ(select({.sessions = {8}}), "2");
+  EXPECT_EQ(select({.sessions = {7, 8}}), "123");
+  EXPECT_EQ(select({.sessions = {9}}), "");
+  EXPECT_EQ(select({.selection = {.last = 1}, .sessions = {7}}), "3");
+  EXPECT_EQ(select({.selection = {.since = 104}, .sessions = {7}}), "3");
+  EXPECT_EQ(select({.types = {1}, .sessions = {7}}), "");
+}
+
 TEST_F(EventsTest, ChoosesByApplicationCategoryAndType) {
   for (const char* application : {"player", "browser"}) {
     for (const char* name : {"Session_Playback.Start", "Playback.Stop"}) {

@@ -34,6 +34,16 @@ class StoredEventsFixture : public testing::Test {
     EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
   }
 
+  // The same for a message of the real-time link.
+  void storeLink(std::int64_t session, const platform::Dictionary& payload) {
+    store_->linkMessages().add(
+        {.time = time_,
+         .party = std::make_shared<platform::linux_::LinkParty>(
+             platform::linux_::LinkParty{session, "com.tarno.halvox", "music_session"}),
+         .payload = payload});
+    EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
+  }
+
   [[nodiscard]] std::string directory() const { return scratch_.path("state"); }
 
   client::ScratchDirectory scratch_;

@@ -80,12 +80,17 @@ void addEvents(CommandSet& commands) {
       ->type_name("GLOB")
       ->expected(1)
       ->take_all();
+  addNumbers(events, "--session", request->sessions,
+             "Only events of messages that the link's local back-end stored for this session (-1: "
+             "outside any session)");
   addCategories(events, request->categories, "events");
   addTypes(events, request->types, "events");
   events.add_flag("--all-names", request->hasAllNames, "Show both events of each message");
   events.add_flag("--own", request->hasOwnEvents,
                   "Also show events about connections of halvoxctl itself");
   addSelection(events, request->selection, "events", "--name");
+  // The link stores a message later than its events.
+  events.get_option("--session")->excludes(events.get_option("--follow"));
   commands.onRun(
       events, [request] { return *request; }, runEvents);
 }
