@@ -216,6 +216,21 @@ class Service(Startable):
     def address(self):
         return f"unix:path={self.socket}"
 
+    def ctl_environment(self, **more):
+        """The variables with which halvoxctl finds this service and its store."""
+        return {**os.environ, "HALVOX_CONFIG": str(self.config), **more}
+
+    def ctl(self, *arguments, status=0, stdin="", text=True):
+        """Runs halvoxctl with the configuration of this service. Returns the finished process, and
+        fails with what it reports unless it ends with that status."""
+        result = subprocess.run([CTL, *map(str, arguments)], capture_output=True, text=text, check=False,
+                                timeout=DEADLINE, input=stdin if text else stdin.encode(),
+                                env=self.ctl_environment())
+        if result.returncode != status:
+            raise AssertionError(f"halvoxctl ended with {result.returncode} instead of {status}: "
+                                 f"{result.stderr}")
+        return result
+
     def log(self):
         return self.log_path.read_text(errors="replace")
 
@@ -280,7 +295,7 @@ class Follower:
         words = [command] if isinstance(command, str) else command
         self._process = subprocess.Popen(
             [*WITH_US, str(CTL), *words, "--follow", "--json"], stdin=subprocess.DEVNULL,
-            stdout=subprocess.PIPE, env={**os.environ, "HALVOX_CONFIG": str(service.config)})
+            stdout=subprocess.PIPE, env=service.ctl_environment())
         os.set_blocking(self._process.stdout.fileno(), False)
         self._bytes = b""
 

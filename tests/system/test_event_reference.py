@@ -2,15 +2,13 @@
 
 import contextlib
 import json
-import os
 import signal
-import subprocess
 import sys
 import unittest
 from pathlib import Path
 
 import audio
-from harness import CTL, DEADLINE, Service, stop_process, wait_for
+from harness import DEADLINE, Service, stop_process, wait_for
 
 sys.path.insert(0, str(Path(__file__).resolve().parents[1]))
 
@@ -39,9 +37,7 @@ class EventReferenceTest(unittest.TestCase):
             self.ctl("preferences", "set", domain, key, "Kitchen")
 
     def ctl(self, *arguments):
-        return subprocess.run([CTL, *arguments], capture_output=True, text=True, check=True,
-                              timeout=DEADLINE,
-                              env={**os.environ, "HALVOX_CONFIG": str(self.service.config)}).stdout
+        return self.service.ctl(*arguments).stdout
 
     def json(self, *arguments):
         return [json.loads(line) for line in self.ctl(*arguments, "--json").splitlines()]

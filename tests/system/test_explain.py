@@ -1,11 +1,9 @@
 """Why messages are where they are."""
 
 import json
-import os
-import subprocess
 import unittest
 
-from harness import CTL, DEADLINE, Service, wait_for
+from harness import Service, wait_for
 
 SESSION_PLAYBACK, SESSION_GENERIC, VOLUME, ERROR = 0x08000004, 0x08000001, 14, 11
 START, STOP, ISSUE, JOULEBOOK, STATE = 1, 2, 7, 8, 18
@@ -28,12 +26,8 @@ class Explaining(unittest.TestCase):
         self.client.configure({"HostApplicationDisplayID": application}, reporter)
         self.client.start_later(reporter)
 
-    def ctl(self, *arguments, status=0):
-        result = subprocess.run(
-            [CTL, *map(str, arguments)], capture_output=True, text=True, check=False, timeout=DEADLINE,
-            env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
-        self.assertEqual(result.returncode, status, result.stderr)
-        return result
+    def ctl(self, *arguments, **options):
+        return self.service.ctl(*arguments, **options)
 
     def explain(self, target):
         lines = self.ctl("explain", target, "--json", "--socket", self.service.socket).stdout.splitlines()

@@ -61,7 +61,7 @@ class ExportTestCase(unittest.TestCase):
 
     @classmethod
     def environment(cls):
-        return {**os.environ, "HALVOX_CONFIG": str(cls.service.config), "TZ": "UTC"}
+        return cls.service.ctl_environment(TZ="UTC")
 
     def export(self, *arguments, status=0):
         result = subprocess.run([CTL, "export", *map(str, arguments)], capture_output=True,

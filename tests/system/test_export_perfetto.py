@@ -83,12 +83,7 @@ class PerfettoTestCase(unittest.TestCase):
 
     @classmethod
     def ctl(cls, *arguments):
-        result = subprocess.run([CTL, *map(str, arguments)], capture_output=True, check=False,
-                                timeout=DEADLINE,
-                                env={**os.environ, "HALVOX_CONFIG": str(cls.service.config)})
-        if result.returncode != 0:
-            raise AssertionError(result.stderr.decode())
-        return result.stdout
+        return cls.service.ctl(*arguments, text=False).stdout
 
     @classmethod
     def rows(cls, *arguments):

@@ -1,16 +1,10 @@
 """The keys of stored records."""
 
-import contextlib
-import fcntl
 import json
-import os
-import pty
-import struct
-import subprocess
-import termios
 import unittest
 
-from harness import CTL, DEADLINE, Service, wait_for
+from harness import Service, wait_for
+from terminal import lines_at_terminal
 
 VOLUME, STATE = 14, 18
 SESSION_PLAYBACK, JOULEBOOK = 0x08000004, 8
@@ -37,12 +31,8 @@ class FieldsTest(unittest.TestCase):
         wait_for("the events", lambda: len(self.service.events()) == 6)
         wait_for("the power event", lambda: "EngineOnDuration" in self.fields())
 
-    def ctl(self, *arguments, status=0):
-        result = subprocess.run(
-            [CTL, *arguments], capture_output=True, text=True, check=False, timeout=DEADLINE,
-            env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
-        self.assertEqual(result.returncode, status, result.stderr)
-        return result
+    def ctl(self, *arguments, **options):
+        return self.service.ctl(*arguments, **options)
 
     def fields(self, *arguments):
         lines = self.ctl("fields", "--json", *arguments).stdout.splitlines()
@@ -73,24 +63,10 @@ class FieldsTest(unittest.TestCase):
     def test_a_table_fits_the_terminal(self):
         self.assertIn("Session_Playback.Start", self.ctl("fields").stdout)
         for width in (40, 80, 120):
-            lines = self.at_terminal(width, "fields")
+            lines = lines_at_terminal(self.service, "fields", columns=width)
             self.assertEqual(len(lines), len(self.fields()) + 1)
             for line in lines:
                 self.assertLessEqual(len(line), width, line)
-
-    def at_terminal(self, width, *arguments):
-        ours, theirs = pty.openpty()
-        fcntl.ioctl(theirs, termios.TIOCSWINSZ, struct.pack("HHHH", 24, width, 0, 0))
-        process = subprocess.Popen([CTL, *arguments], stdin=subprocess.DEVNULL, stdout=theirs,
-                                   env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
-        os.close(theirs)
-        text = b""
-        with contextlib.suppress(OSError):  # the end of the other side
-            while piece := os.read(ours, 4096):
-                text += piece
-        os.close(ours)
-        self.assertEqual(process.wait(DEADLINE), 0)
-        return text.decode().splitlines()
 
 
 if __name__ == "__main__":

@@ -35,12 +35,8 @@ class QueriesTest(unittest.TestCase):
         return int(self.ctl("sql", "SELECT count(*) FROM link_messages"
                             " WHERE payload ->> 'number' IS NOT NULL").stdout.split()[1])
 
-    def ctl(self, *arguments, status=0, stdin=""):
-        result = subprocess.run(
-            [CTL, *arguments], capture_output=True, text=True, check=False, timeout=DEADLINE,
-            input=stdin, env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
-        self.assertEqual(result.returncode, status, result.stderr)
-        return result
+    def ctl(self, *arguments, **options):
+        return self.service.ctl(*arguments, **options)
 
     def json(self, *arguments):
         return [json.loads(line) for line in self.ctl(*arguments, "--json").stdout.splitlines()]

@@ -11,7 +11,7 @@ from pathlib import Path
 
 import audio
 import browser
-from harness import CTL, DEADLINE, Service, stop_process, wait_for
+from harness import CTL, Service, stop_process, wait_for
 
 XRUNS = """SELECT count(*) AS n, coalesce(sum(payload ->> 'missed_cycles'), 0) AS cycles
     FROM analytics_events WHERE name GLOB 'com.tarno.halvox.*.IssueDetector'
@@ -77,12 +77,7 @@ class ReportTestCase(unittest.TestCase):
 
     @classmethod
     def ctl(cls, *arguments):
-        result = subprocess.run(
-            [CTL, *arguments], capture_output=True, text=True, check=False, timeout=DEADLINE,
-            env={**os.environ, "HALVOX_CONFIG": str(cls.service.config)})
-        if result.returncode != 0:
-            raise AssertionError(result.stderr)
-        return result.stdout
+        return cls.service.ctl(*arguments).stdout
 
     @classmethod
     def rows(cls, *arguments):

@@ -1,22 +1,20 @@
 """Commands that show stored rows: following without a gap, cursors, and what a person at a terminal
 sees."""
 
-import fcntl
 import itertools
 import json
 import os
 import pty
 import re
 import select
-import struct
 import subprocess
-import termios
 import threading
 import time
 import unittest
 
 from harness import (CTL, DEADLINE, WITH_US, Service, connect_to_store, require, stop_process,
                      wait_for)
+from terminal import lines_at_terminal
 
 ESCAPE = re.compile("\x1b\\[[0-9;]*m")
 NUMBER = re.compile(rb'"number":(\d+)')
@@ -54,13 +52,10 @@ class WithMessages(unittest.TestCase):
             return store.execute(sql, arguments).fetchall()
 
     def environment(self, **more):
-        return {**os.environ, "HALVOX_CONFIG": str(self.service.config), **more}
+        return self.service.ctl_environment(**more)
 
-    def ctl(self, *arguments, status=0):
-        result = subprocess.run([CTL, *arguments], capture_output=True, text=True, check=False,
-                                timeout=DEADLINE, env=self.environment())
-        self.assertEqual(result.returncode, status, result.stderr)
-        return result
+    def ctl(self, *arguments, **options):
+        return self.service.ctl(*arguments, **options)
 
     def numbers(self, *arguments):
         """The numbers of the messages that are shown as lines."""
@@ -336,47 +331,8 @@ class TerminalTest(WithMessages):
         self.send(range(60), text="x" * 200)
         self.wait_for_number(59)
 
-    def at_terminal(self, *arguments, columns=100, status=0, **environment):
-        """What a terminal of that width gets, and standard error."""
-        master, slave = pty.openpty()
-        fcntl.ioctl(slave, termios.TIOCSWINSZ, struct.pack("HHHH", 24, columns, 0, 0))
-        # Lines as the program wrote them.
-        attributes = termios.tcgetattr(slave)
-        attributes[1] &= ~termios.OPOST
-        termios.tcsetattr(slave, termios.TCSANOW, attributes)
-        variables = self.environment(TERM="xterm", **environment)
-        for name in ("NO_COLOR", "HALVOX_PAGER", "PAGER", "LESS", "LESSCHARSET"):
-            if name not in environment:
-                variables.pop(name, None)
-        process = subprocess.Popen(
-            [*WITH_US, str(CTL), *arguments], stdin=slave, stdout=slave, stderr=subprocess.PIPE,
-            env=variables, start_new_session=True,
-            preexec_fn=lambda: fcntl.ioctl(0, termios.TIOCSCTTY, 0))
-        os.close(slave)
-        output = b""
-        end = time.monotonic() + DEADLINE
-        while True:
-            readable, _, _ = select.select([master], [], [], max(0, end - time.monotonic()))
-            if not readable:
-                process.kill()
-                self.fail(f"the output did not end: {output!r}")
-            try:
-                data = os.read(master, 65536)
-            except OSError:  # no process has the terminal open any more
-                break
-            if not data:
-                break
-            output += data
-        os.close(master)
-        errors = process.stderr.read().decode()
-        process.stderr.close()
-        self.assertEqual(process.wait(DEADLINE), status, errors)
-        return output.decode(), errors
-
     def lines(self, *arguments, **more):
-        output, errors = self.at_terminal(*arguments, **more)
-        self.assertEqual(errors, "")
-        return output.splitlines()
+        return lines_at_terminal(self.service, *arguments, **more)
 
     def test_every_line_fits_the_terminal(self):
         for command in ("events", "link", "power", "metrics"):

@@ -6,13 +6,12 @@ import json
 import os
 import re
 import shutil
-import subprocess
 import tempfile
 import time
 import unittest
 from pathlib import Path
 
-from harness import CTL, Service, connect_to_store, iterate_until, wait_for
+from harness import Service, connect_to_store, iterate_until, wait_for
 
 DOMAIN = "com.tarno.halvox"
 NOTIFICATION = "com.tarno.halvox.reporting"
@@ -41,11 +40,8 @@ class Settings(unittest.TestCase):
         self.file = state / "preferences" / "mobile" / f"{DOMAIN}.toml"
         self.notify = state / "notify"
 
-    def ctl(self, *arguments, status=0):
-        result = subprocess.run([str(CTL), *arguments], capture_output=True, text=True, check=False,
-                                env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
-        self.assertEqual(result.returncode, status, result.stderr)
-        return result.stdout
+    def ctl(self, *arguments):
+        return self.service.ctl(*arguments).stdout
 
     def set_device_name(self, name):
         self.ctl("preferences", "set", DOMAIN, "device_name", name)

@@ -1,19 +1,14 @@
 """halvoxctl streams: what the store says of sessions of the real service, and of real audio."""
 
 import contextlib
-import fcntl
 import json
-import os
-import pty
 import re
 import signal
-import struct
-import subprocess
-import termios
 import unittest
 
 import audio
-from harness import CTL, DEADLINE, Service, stop_process, wait_for
+from harness import Service, stop_process, wait_for
+from terminal import lines_at_terminal
 
 SESSION_PLAYBACK = 0x08000004
 VOLUME = 14
@@ -35,12 +30,8 @@ class StreamsTest(unittest.TestCase):
         self.service.__enter__()
         self.addCleanup(self.service.__exit__)
 
-    def ctl(self, *arguments, status=0):
-        result = subprocess.run(
-            [CTL, *map(str, arguments)], capture_output=True, text=True, check=False, timeout=DEADLINE,
-            env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
-        self.assertEqual(result.returncode, status, result.stderr)
-        return result
+    def ctl(self, *arguments, **options):
+        return self.service.ctl(*arguments, **options)
 
     def json(self, *arguments):
         return [json.loads(line) for line in self.ctl(*arguments, "--json").stdout.splitlines()]
@@ -206,25 +197,11 @@ class StreamsTest(unittest.TestCase):
         whole = self.ctl("streams").stdout
         self.assertIn("of which not all fits", whole)
         for width in (40, 80, 120, 160):
-            lines = self.at_terminal(width, "streams")
+            lines = lines_at_terminal(self.service, "streams", columns=width)
             self.assertEqual(len(lines), 2)
             for line in lines:
                 self.assertLessEqual(len(line), width, line)
             self.assertTrue(width == 160 or "…" in lines[1], lines[1])
-
-    def at_terminal(self, width, *arguments):
-        ours, theirs = pty.openpty()
-        fcntl.ioctl(theirs, termios.TIOCSWINSZ, struct.pack("HHHH", 24, width, 0, 0))
-        process = subprocess.Popen([CTL, *arguments], stdin=subprocess.DEVNULL, stdout=theirs,
-                                   env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
-        os.close(theirs)
-        text = b""
-        with contextlib.suppress(OSError):  # the end of the other side
-            while piece := os.read(ours, 4096):
-                text += piece
-        os.close(ours)
-        self.assertEqual(process.wait(DEADLINE), 0)
-        return text.decode().splitlines()
 
 
 @unittest.skipIf(audio.missing(), audio.missing())
@@ -238,8 +215,7 @@ class RealStreamsTest(unittest.TestCase):
         self.stack = stack
 
     def streams(self):
-        result = subprocess.run([CTL, "streams", "--json"], capture_output=True, text=True, check=True,
-                                env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
+        result = self.service.ctl("streams", "--json")
         return [json.loads(line) for line in result.stdout.splitlines()]
 
     def play(self, *arguments, **options):
