@@ -373,6 +373,13 @@ class Client:
     def configure(self, configuration, reporter):
         return self.call("setConfiguration", "a{sv}x", variants(configuration), reporter)
 
+    def begin(self, reporter, service_type, application):
+        """Creates and starts a session of that type and application."""
+        self.create(reporter)
+        self.set_type(service_type, reporter)
+        self.configure({"HostApplicationDisplayID": application}, reporter)
+        self.start_later(reporter)
+
     def start_later(self, reporter):
         return self.call_later("startReportingSessionForID", "x", reporter)
 

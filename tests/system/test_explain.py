@@ -21,10 +21,7 @@ class Explaining(unittest.TestCase):
         self.addCleanup(self.client.close)
 
     def session(self, reporter, service_type=LONG_FORM, application="player"):
-        self.client.create(reporter)
-        self.client.set_type(service_type, reporter)
-        self.client.configure({"HostApplicationDisplayID": application}, reporter)
-        self.client.start_later(reporter)
+        self.client.begin(reporter, service_type, application)
 
     def ctl(self, *arguments, **options):
         return self.service.ctl(*arguments, **options)

@@ -60,6 +60,16 @@ class ExportTestCase(unittest.TestCase):
     service = None
 
     @classmethod
+    def start(cls):
+        """Starts the service for all tests of a class. Returns a client."""
+        cls.service = Service("[drivers]\nalsa = false\npipewire = false\n")
+        cls.service.__enter__()
+        cls.addClassCleanup(cls.service.__exit__)
+        client = cls.service.client()
+        cls.addClassCleanup(client.close)
+        return client
+
+    @classmethod
     def environment(cls):
         return cls.service.ctl_environment(TZ="UTC")
 
@@ -100,16 +110,9 @@ class ExportTest(ExportTestCase):
 
     @classmethod
     def setUpClass(cls):
-        cls.service = Service("[drivers]\nalsa = false\npipewire = false\n")
-        cls.service.__enter__()
-        cls.addClassCleanup(cls.service.__exit__)
-        client = cls.service.client()
-        cls.addClassCleanup(client.close)
+        client = cls.start()
         for session, application in APPLICATIONS.items():
-            client.create(session)
-            client.set_type(LONG_FORM_AUDIO, session)
-            client.configure({"HostApplicationDisplayID": application}, session)
-            client.start_later(session)
+            client.begin(session, LONG_FORM_AUDIO, application)
             for message, kind in (({"run": 1}, START), (HOSTILE, JOULEBOOK),
                                   ({"issue_type": "xrun", "node": "mixer",
                                     "rtaid_client": application}, ISSUE),
@@ -302,15 +305,8 @@ class LargeStoreTest(ExportTestCase):
 
     @classmethod
     def setUpClass(cls):
-        cls.service = Service("[drivers]\nalsa = false\npipewire = false\n")
-        cls.service.__enter__()
-        cls.addClassCleanup(cls.service.__exit__)
-        client = cls.service.client()
-        cls.addClassCleanup(client.close)
-        client.create(7)
-        client.set_type(LONG_FORM_AUDIO, 7)
-        client.configure({"HostApplicationDisplayID": "org.example.player"}, 7)
-        client.start_later(7)
+        client = cls.start()
+        client.begin(7, LONG_FORM_AUDIO, "org.example.player")
         filler = os.urandom(cls.BYTES // 2).hex()
         for number in range(cls.MESSAGES):
             client.send({"number": number, "filler": filler[number % 500:]}, SESSION_PLAYBACK, START, [7])

@@ -14,11 +14,11 @@ from pathlib import Path
 
 import perfetto
 from harness import CTL, DEADLINE, Service, connect_to_store, wait_for
+from player import begin_stream
 
 SCHEMA = Path(__file__).resolve().parents[2] / "tools/export/perfetto_trace.proto"
-LONG_FORM_AUDIO = 7  # service type
-SETUP, ROUTE_CHANGE, VOLUME, PLAYBACK = 0x08000008, 10, 14, 0x08000004
-START, STOP, SETUP_TYPE, ERROR, ISSUE, STATE = 1, 2, 5, 6, 7, 18
+VOLUME, PLAYBACK = 14, 0x08000004
+STOP, ERROR, ISSUE, STATE = 2, 6, 7, 18
 RESULTS = "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces/tracing_results.ssj"
 XRUNS = {7: (21.25, 40.0), 8: (3.5,)}
 # The last one is still running.
@@ -27,16 +27,7 @@ APPLICATIONS = {7: "org.example.player", 8: "org.example.<browser>\u00e9", 9: "o
 
 def play(client, session, application, xruns):
     """What a player reports that plays, changes its volume, has xruns and stops."""
-    client.create(session)
-    client.set_type(LONG_FORM_AUDIO, session)
-    client.configure({"HostApplicationDisplayID": application}, session)
-    client.start_later(session)
-
-    def send(message, category, kind):
-        client.send(message, category=category, event_type=kind, reporters=[session])
-    send({"session_selected_format": "F32LE 48000 Hz 2 ch"}, SETUP, SETUP_TYPE)
-    send({"active_devices": "Speakers", "device_node_names": ["alsa.speakers"]}, ROUTE_CHANGE, STATE)
-    send({"run": 1}, PLAYBACK, START)
+    send = begin_stream(client, session, application, node="alsa.speakers")
     for volume in (0.75, 0.5):
         send({"RQSessionVolume": volume, "RQSessionVolumePlayingState": 1}, VOLUME, STATE)
     for milliseconds in xruns:

@@ -19,10 +19,7 @@ class FieldsTest(unittest.TestCase):
         self.client = self.service.client()
         self.addCleanup(self.client.close)
         for session, service_type in ((7, LONG_FORM), (8, HAPTICS)):
-            self.client.create(session)
-            self.client.set_type(service_type, session)
-            self.client.configure({"HostApplicationDisplayID": f"org.app{session}"}, session)
-            self.client.start_later(session)
+            self.client.begin(session, service_type, f"org.app{session}")
         self.client.send({"gain": 0.5, "list": [1, 2]}, VOLUME, STATE, [7])
         self.client.send({"gain": "high"}, SESSION_PLAYBACK, 1, [8])
         self.client.send({"EngineOnTime": 4.5}, SESSION_PLAYBACK, JOULEBOOK, [8])

@@ -23,10 +23,7 @@ class QueriesTest(unittest.TestCase):
         self.client = self.service.client()
         self.addCleanup(self.client.close)
         for session in (7, 8):
-            self.client.create(session)
-            self.client.set_type(7, session)
-            self.client.configure({"HostApplicationDisplayID": f"org.app{session}"}, session)
-            self.client.start_later(session)
+            self.client.begin(session, 7, f"org.app{session}")
         for number in range(MESSAGES):
             self.client.send({"number": number}, reporters=[7 + number % 2])
         wait_for("all messages", lambda: self.stored() == MESSAGES)

@@ -12,14 +12,13 @@ from pathlib import Path
 import audio
 import browser
 from harness import CTL, Service, stop_process, wait_for
+from player import begin_stream
 
 XRUNS = """SELECT count(*) AS n, coalesce(sum(payload ->> 'missed_cycles'), 0) AS cycles
     FROM analytics_events WHERE name GLOB 'com.tarno.halvox.*.IssueDetector'
     AND payload ->> 'issue_type' = 'xrun'"""
-LONG_FORM_AUDIO = 7  # service type
-SETUP, ROUTE_CHANGE, VOLUME = 0x08000008, 10, 14
-PLAYBACK = 0x08000004
-START, STOP, SETUP_TYPE, ISSUE, STATE = 1, 2, 5, 7, 18
+VOLUME, PLAYBACK = 14, 0x08000004
+STOP, ISSUE, STATE = 2, 7, 18
 # A name may contain anything that is UTF-8.
 HOSTILE = ["</script><script>document.title = 'taken'</script>", "<img src=x onerror=alert(1)>",
            "evil\u202egnp.exe", "zero\u200bwidth", "&lt;b&gt;\"'`", "<!-- ", "]]>", "x" * 10_000]
@@ -44,16 +43,7 @@ def why_skip():
 
 def send_stream(client, session, application, xruns=(), device="Speakers"):
     """What a player reports that plays, changes its volume, has xruns and stops."""
-    client.create(session)
-    client.set_type(LONG_FORM_AUDIO, session)
-    client.configure({"HostApplicationDisplayID": application}, session)
-    client.start_later(session)
-
-    def send(message, category, kind):
-        client.send(message, category=category, event_type=kind, reporters=[session])
-    send({"session_selected_format": "F32LE 48000 Hz 2 ch"}, SETUP, SETUP_TYPE)
-    send({"active_devices": device, "device_node_names": ["speakers"]}, ROUTE_CHANGE, STATE)
-    send({"run": 1}, PLAYBACK, START)
+    send = begin_stream(client, session, application, device)
     send({"RQSessionVolume": 0.8, "RQSessionVolumePlayingState": 1}, VOLUME, STATE)
     for number, milliseconds in enumerate(xruns):
         send({"issue_type": "xrun", "node": application, "rtaid_client": application, "number": number,

@@ -34,10 +34,7 @@ class WithMessages(unittest.TestCase):
     def begin(self):
         self.client = self.service.client()
         self.addCleanup(self.client.close)
-        self.client.create(7)
-        self.client.set_type(7, 7)
-        self.client.configure({"HostApplicationDisplayID": "org.example.player"}, 7)
-        self.client.start_later(7)
+        self.client.begin(7, 7, "org.example.player")
 
     def send(self, numbers, **more):
         for number in numbers:

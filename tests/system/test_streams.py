@@ -50,10 +50,7 @@ class StreamsTest(unittest.TestCase):
         return client
 
     def begin(self, client, session, application="player"):
-        client.create(session)
-        client.set_type(7, session)
-        client.configure({"HostApplicationDisplayID": application}, session)
-        client.start_later(session)
+        client.begin(session, 7, application)
         client.send({"run": 1}, SESSION_PLAYBACK, START, [session])
 
     def set_volume(self, client, session, volume, playing):
