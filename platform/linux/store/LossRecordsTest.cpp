@@ -28,6 +28,17 @@ class LossRecordsTest : public StoreFixture {
     send(1);
     ASSERT_TRUE(eventually([&] { return allIsStored(); }));
   }
+  // Counts a loss that is due with the next transaction, and lets that transaction fail.
+  void loseInFailedTransaction() {
+    storeOne();
+    count("session", "dropped: a", 5);
+    platform.clock.setCurrentDate({kNow + 60});
+    Database other;
+    ASSERT_EQ(other.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
+    ASSERT_TRUE(eventually([&] { return other.execute("BEGIN IMMEDIATE") == SQLITE_OK; }));
+    send(2);
+    ASSERT_TRUE(eventually([&] { return counted("dropped: database locked") == 1; }));
+  }
   [[nodiscard]] std::vector<std::string> losses() const {
     return rows(database(), "SELECT piece, reason, count FROM losses");
   }
@@ -92,16 +103,7 @@ TEST_F(LossRecordsTest, AClockThatWasSetBackDoesNotDelayThem) {
 
 TEST_F(LossRecordsTest, WhatAFailedTransactionHadComesWithTheNextOne) {
   start();
-  storeOne();
-  count("session", "dropped: a", 5);
-  platform.clock.setCurrentDate({kNow + 60});
-  {
-    Database other;
-    ASSERT_EQ(other.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
-    ASSERT_TRUE(eventually([&] { return other.execute("BEGIN IMMEDIATE") == SQLITE_OK; }));
-    send(2);
-    ASSERT_TRUE(eventually([&] { return counted("dropped: database locked") == 1; }));
-  }
+  loseInFailedTransaction();
   platform.clock.setCurrentDate({kNow + 120});
   storeOne();
 
@@ -113,16 +115,7 @@ TEST_F(LossRecordsTest, WhatAFailedTransactionHadComesWithTheNextOne) {
 
 TEST_F(LossRecordsTest, AFailedTransactionDoesNotDelayThem) {
   start();
-  storeOne();
-  count("session", "dropped: a", 5);
-  platform.clock.setCurrentDate({kNow + 60});
-  {
-    Database other;
-    ASSERT_EQ(other.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
-    ASSERT_TRUE(eventually([&] { return other.execute("BEGIN IMMEDIATE") == SQLITE_OK; }));
-    send(2);
-    ASSERT_TRUE(eventually([&] { return counted("dropped: database locked") == 1; }));
-  }
+  loseInFailedTransaction();
 
   storeOne();  // at the same time
 
