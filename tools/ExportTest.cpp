@@ -4,12 +4,11 @@
 #include <fstream>
 #include <iterator>
 #include <memory>
-#include <sstream>
 #include <string>
 
 #include <gmock/gmock.h>
 
-#include "tools/StoredEventsFixture.h"
+#include "tools/StoreCommandFixture.h"
 
 namespace halvox::tools {
 namespace {
@@ -17,31 +16,20 @@ namespace {
 using ::testing::HasSubstr;
 using ::testing::StartsWith;
 
-class ExportTest : public StoredEventsFixture {
+class ExportTest : public StoreCommandFixture {
  protected:
   ExportTest() { store("com.a", {{"n", 1}}); }
 
   ExitStatus run(ExportRecords request = {}) {
-    output_.str("");
-    errors_.str("");
-    std::istringstream none;
     if (request.to == "-" && request.format == ExportFormat::kSqlite) request.to = file();
     request.database = directory();
-    return exportRecords(request, options_, {none, output_, errors_});
+    return exportRecords(request, options_, streams());
   }
   [[nodiscard]] std::string file() const { return scratch_.path("plain.db"); }
   [[nodiscard]] std::string content() const {
     std::ifstream stream(file());
     return {std::istreambuf_iterator<char>(stream), {}};
   }
-  [[nodiscard]] std::string output() const { return output_.str(); }
-  [[nodiscard]] std::string errors() const { return errors_.str(); }
-
-  CommonOptions options_;
-
- private:
-  std::ostringstream output_;
-  std::ostringstream errors_;
 };
 
 TEST_F(ExportTest, SaysHowManyRecordsItWrote) {

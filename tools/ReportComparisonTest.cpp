@@ -1,13 +1,12 @@
 #include "tools/ReportComparison.h"
 
 #include <fstream>
-#include <sstream>
 #include <string>
 
 #include <gmock/gmock.h>
 
 #include "tools/ReportPage.h"
-#include "tools/StoredEventsFixture.h"
+#include "tools/StoreCommandFixture.h"
 
 namespace halvox::tools {
 namespace {
@@ -70,7 +69,7 @@ TEST(ComparedPeriodTest, WhatIsNeitherIsRefusedWithWhatIsExpected) {
 
 // Events are one second apart: three sessions, each with an xrun, from 100 seconds after 1970 on,
 // and three more with three xruns each.
-class ReportComparisonTest : public StoredEventsFixture {
+class ReportComparisonTest : public StoreCommandFixture {
  protected:
   void SetUp() override {
     for (int session = 0; session < 3; ++session) play(session, 1);
@@ -92,23 +91,14 @@ class ReportComparisonTest : public StoredEventsFixture {
   }
 
   ExitStatus run(const std::string& before, const std::string& after, const std::string& to = "") {
-    output_.str("");
-    errors_.str("");
-    std::istringstream none;
     return compareReports({.before = *parseComparedPeriod(before, kNow),
                            .after = *parseComparedPeriod(after, kNow),
                            .to = to,
                            .database = directory()},
-                          options_, {none, output_, errors_});
+                          options_, streams());
   }
-  [[nodiscard]] std::string output() const { return output_.str(); }
-  [[nodiscard]] std::string errors() const { return errors_.str(); }
-
-  CommonOptions options_;
 
  private:
-  std::ostringstream output_;
-  std::ostringstream errors_;
   int time_ = 100;
 };
 

@@ -2,13 +2,12 @@
 
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 #include <string>
 
 #include <gmock/gmock.h>
 
 #include "tools/ReportPage.h"
-#include "tools/StoredEventsFixture.h"
+#include "tools/StoreCommandFixture.h"
 
 namespace halvox::tools {
 namespace {
@@ -18,7 +17,7 @@ using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::StartsWith;
 
-class ReportTest : public StoredEventsFixture {
+class ReportTest : public StoreCommandFixture {
  protected:
   void SetUp() override {
     if (reportPageBeforeData().empty()) GTEST_SKIP() << "this build has no page (HALVOX_REPORT)";
@@ -26,24 +25,13 @@ class ReportTest : public StoredEventsFixture {
   }
 
   ExitStatus run(const std::string& to) {
-    output_.str("");
-    errors_.str("");
-    std::istringstream none;
-    return writeReport({.to = to, .database = directory()}, options_, {none, output_, errors_});
+    return writeReport({.to = to, .database = directory()}, options_, streams());
   }
   [[nodiscard]] std::string file() const { return scratch_.path("report.html"); }
-  [[nodiscard]] std::string output() const { return output_.str(); }
-  [[nodiscard]] std::string errors() const { return errors_.str(); }
   [[nodiscard]] std::string content() const {
     std::ifstream stream(file());
     return {std::istreambuf_iterator<char>(stream), {}};
   }
-
-  CommonOptions options_;
-
- private:
-  std::ostringstream output_;
-  std::ostringstream errors_;
 };
 
 TEST_F(ReportTest, WritesAPageAndSaysWhatIsInIt) {

@@ -1,12 +1,11 @@
 #include "tools/Sql.h"
 
 #include <memory>
-#include <sstream>
 #include <string>
 
 #include <gmock/gmock.h>
 
-#include "tools/StoredEventsFixture.h"
+#include "tools/StoreCommandFixture.h"
 
 namespace halvox::tools {
 namespace {
@@ -14,27 +13,17 @@ namespace {
 using ::testing::HasSubstr;
 
 // A store with two events, 100 and 101 seconds after 1970.
-class SqlTest : public StoredEventsFixture {
+class SqlTest : public StoreCommandFixture {
  protected:
   SqlTest() {
     for (int number = 0; number < 2; ++number) store("com.a\x1b[2J", {{"n", number}});
   }
 
   ExitStatus run(const std::string& query, const std::string& input = "", bool isTerminal = false) {
-    output_.str("");
-    errors_.str("");
-    std::istringstream stream(input);
-    return runSql({.query = query, .database = directory()}, options_,
-                  {stream, output_, errors_, -1, isTerminal});
+    ToolStreams used = streams(input);
+    used.isInputTerminal = isTerminal;
+    return runSql({.query = query, .database = directory()}, options_, used);
   }
-  [[nodiscard]] std::string output() const { return output_.str(); }
-  [[nodiscard]] std::string errors() const { return errors_.str(); }
-
-  CommonOptions options_;
-
- private:
-  std::ostringstream output_;
-  std::ostringstream errors_;
 };
 
 TEST_F(SqlTest, PrintsTheNamesOfTheColumnsAndTheRows) {
