@@ -8,6 +8,7 @@
 #include <variant>
 
 #include "platform/linux/runtime/Version.h"
+#include "platform/linux/store/StoreSchema.h"
 #include "platform/value.h"
 #include "tools/Complaint.h"
 #include "tools/JsonText.h"
@@ -112,7 +113,7 @@ ExitStatus writeReport(const WriteReport& request, const CommonOptions& options,
   auto data = readReportData({.directory = path, .since = request.since, .until = request.until});
   if (!data) return complain(ExitStatus::kNoService, data.error().message, "no-store");
   ReportFrame frame{.program = "halvoxctl " + std::string(platform::linux_::halvoxVersion()),
-                    .store = (path / "halvox.db").native(),
+                    .store = (path / platform::linux_::kStoreFileName).native(),
                     .made = timeNow(),
                     .since = request.since,
                     .until = request.until};

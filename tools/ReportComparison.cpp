@@ -11,6 +11,7 @@
 #include "analysis/Comparison.h"
 
 #include "platform/linux/runtime/Version.h"
+#include "platform/linux/store/StoreSchema.h"
 #include "platform/value.h"
 #include "tools/Complaint.h"
 #include "tools/JsonText.h"
@@ -149,7 +150,8 @@ std::variant<Side, ExitStatus> readSide(const CompareReports& request, const Com
                               .since = hasTimes ? period.since : request.since,
                               .until = hasTimes ? period.until : request.until});
   if (!data) return complain(ExitStatus::kNoService, data.error().message, "no-store");
-  return Side{.store = (path / "halvox.db").native(), .data = *std::move(data)};
+  return Side{.store = (path / platform::linux_::kStoreFileName).native(),
+              .data = *std::move(data)};
 }
 
 std::string pageOf(const Side& before, const Side& after, const std::vector<Change>& changes) {

@@ -10,13 +10,13 @@
 
 #include "client/ServicePlaces.h"
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
+#include "platform/linux/store/StoreSchema.h"
 
 namespace halvox::tools {
 namespace {
 
 using platform::linux_::Configuration;
-
-constexpr const char* kDatabaseName = "halvox.db";
+using platform::linux_::kStoreFileName;
 
 bool isSocketInTheEnvironment() {
   const char* value = std::getenv("HALVOX_SOCKET");
@@ -33,7 +33,7 @@ struct StoreSearch {
 StoreSearch searchStore() {
   StoreSearch search{.directory = platform::linux_::userStorageDirectory()};
   for (const auto& directory : {search.directory, platform::linux_::systemStorageDirectory()}) {
-    const auto database = directory / kDatabaseName;
+    const auto database = directory / kStoreFileName;
     struct stat status {};
     // A store that this user may not read counts as present: the error then names it.
     if (::stat(database.c_str(), &status) == 0 || !client::meansAbsence(errno)) {

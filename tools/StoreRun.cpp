@@ -12,6 +12,7 @@
 
 #include <poll.h>
 
+#include "platform/linux/store/StoreSchema.h"
 #include "tools/Pager.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/TextTable.h"
@@ -21,13 +22,13 @@ namespace {
 
 using platform::linux_::EventFollower;
 using platform::linux_::Failure;
+using platform::linux_::kStoreFileName;
 using platform::linux_::RecordFilter;
 using platform::linux_::RecordOrder;
 using platform::linux_::Result;
 using platform::linux_::StoreError;
 using platform::linux_::StoreReader;
 
-constexpr const char* kDatabaseName = "halvox.db";
 constexpr std::uint64_t kShownWhenFollowing = 10;
 
 ExitStatus cannotRead(const StoreRun& run, const Failure<StoreError>& failure) {
@@ -185,12 +186,12 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string
   std::error_code ignored;
   if (std::filesystem::is_directory(path, ignored)) return path;
   // The file may be missing. The reader of the store reports that with its own reason.
-  if (path.filename() == kDatabaseName) {
+  if (path.filename() == kStoreFileName) {
     return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
   }
-  return complain(ExitStatus::kBadArguments, "--database: " + database +
-                                                 " is not a store; expected a " + kDatabaseName +
-                                                 " or the directory that has one");
+  return complain(ExitStatus::kBadArguments,
+                  "--database: " + database + " is not a store; expected a " +
+                      std::string(kStoreFileName) + " or the directory that has one");
 }
 
 RecordFilter filterOf(const RecordSelection& selection) {

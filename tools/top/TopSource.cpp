@@ -12,6 +12,7 @@
 #include "platform/linux/drivers/ConfiguredSources.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/store/StoreSchema.h"
 #include "platform/linux/store/reading/StoreUse.h"
 #include "tools/top/DeviceSampler.h"
 
@@ -173,7 +174,8 @@ void TopSource::readService(TopModel& model, TopReadings& readings) {
 
 std::optional<std::uint64_t> TopSource::storeBytes() const {
   std::optional<std::uint64_t> sum;
-  for (const char* const name : {"halvox.db", "halvox.db-wal", "halvox.db-shm"}) {
+  for (const char* const suffix : {"", "-wal", "-shm"}) {
+    const std::string name = std::string(platform::linux_::kStoreFileName) + suffix;
     std::error_code error;
     const std::uintmax_t bytes = std::filesystem::file_size(places_.store / name, error);
     if (!error) sum = sum.value_or(0) + bytes;
