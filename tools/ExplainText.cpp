@@ -8,12 +8,12 @@
 #include "backends/HVReportingEventNames.h"
 #include "backends/HVReportingUtility.h"
 #include "client/Vocabulary.h"
+#include "platform/linux/configuration/LinkBackendName.h"
 #include "platform/linux/store/EventNames.h"
 
 namespace halvox::tools {
 namespace {
 
-using platform::linux_::LinkBackend;
 using platform::linux_::StoreUse;
 
 std::string hexadecimal(std::uint32_t number) {
@@ -114,15 +114,7 @@ bool isTracingOn(const ExplainSettings& settings) {
 }
 
 std::string backendName(const ExplainSettings& settings) {
-  switch (settings.configuration.link.backend) {
-    case LinkBackend::kLocal:
-      return "local";
-    case LinkBackend::kNats:
-      return "nats";
-    case LinkBackend::kNone:
-      return "none";
-  }
-  return {};
+  return platform::linux_::linkBackendName(settings.configuration.link.backend);
 }
 
 std::vector<std::string> repetitionSentences(const MessageFate& fate) {

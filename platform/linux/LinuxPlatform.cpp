@@ -8,6 +8,7 @@
 
 #include "platform/linux/LinuxAdapters.h"
 #include "platform/linux/StartFailure.h"
+#include "platform/linux/configuration/LinkBackendName.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
 
 namespace halvox::platform::linux_ {
@@ -21,18 +22,6 @@ constexpr std::chrono::seconds kJobsEndWithin{5};
 // kills a service that takes longer than 90 seconds to end.
 constexpr AsioDispatchService::FinishLimits kQueuesFinish{
     .withoutProgress = std::chrono::seconds(5), .total = std::chrono::seconds(30)};
-
-const char* linkName(LinkBackend backend) {
-  switch (backend) {
-    case LinkBackend::kLocal:
-      return "local";
-    case LinkBackend::kNats:
-      return "nats";
-    case LinkBackend::kNone:
-      return "none";
-  }
-  return "";
-}
 
 const char* busName(BusKind kind) {
   switch (kind) {
@@ -156,7 +145,7 @@ void LinuxPlatform::logStart() const {
   log_.notice("serving ", adapters_->configuration.listener.socket.string(), ", bus ",
               busName(adapters_->configuration.listener.bus), ", store ",
               adapters_->configuration.storage.directory.string());
-  log_.notice("link: ", linkName(adapters_->configuration.link.backend));
+  log_.notice("link: ", linkBackendName(adapters_->configuration.link.backend));
   log_.notice("trace points: ", adapters_->tracePoints.description);
   log_.notice("traces: ", adapters_->traces->description());
   if (adapters_->configuration.drivers.alsa && !hasAlsaSource()) {
