@@ -9,10 +9,10 @@
 
 #include "analysis/MessageNames.h"
 #include "analysis/Payload.h"
-#include <fnmatch.h>
 
 #include "client/Vocabulary.h"
 #include "tools/EventRows.h"
+#include "tools/Globs.h"
 #include "tools/JsonText.h"
 #include "tools/StoreRun.h"
 
@@ -56,11 +56,7 @@ bool isOfType(std::string_view name, const std::vector<std::uint16_t>& types) {
 }
 
 bool isOfApplication(const StoredEvent& event, const std::vector<std::string>& patterns) {
-  if (patterns.empty()) return true;
-  const std::string application = applicationOf(event);
-  return std::ranges::any_of(patterns, [&](const std::string& pattern) {
-    return ::fnmatch(pattern.c_str(), application.c_str(), 0) == 0;
-  });
+  return patterns.empty() || matchesAnyGlob(patterns, applicationOf(event));
 }
 
 // Whether the service recorded the event when a command of this program disconnected.

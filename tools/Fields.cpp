@@ -9,11 +9,11 @@
 
 #include "analysis/FieldCollector.h"
 #include "analysis/StoreRecordSource.h"
-#include <fnmatch.h>
 
 #include "client/Vocabulary.h"
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Complaint.h"
+#include "tools/Globs.h"
 #include "tools/JsonText.h"
 #include "tools/StoreRun.h"
 #include "tools/TextTable.h"
@@ -48,10 +48,8 @@ bool hasType(const Record& record, const std::vector<std::uint16_t>& types) {
 
 bool hasApplication(const Record& record, const std::vector<std::string>& patterns) {
   if (patterns.empty()) return true;
-  const std::string application(record.application);
-  return record.kind == RecordKind::kEvent && std::ranges::any_of(patterns, [&](const auto& one) {
-           return ::fnmatch(one.c_str(), application.c_str(), 0) == 0;
-         });
+  return record.kind == RecordKind::kEvent &&
+         matchesAnyGlob(patterns, std::string(record.application));
 }
 
 bool isSelected(const ShowFields& request, const Record& record) {

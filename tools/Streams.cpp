@@ -8,10 +8,10 @@
 
 #include "analysis/StoreRecordSource.h"
 #include "analysis/StreamBuilder.h"
-#include <fnmatch.h>
 
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Complaint.h"
+#include "tools/Globs.h"
 #include "tools/StoreRun.h"
 #include "tools/StreamFinish.h"
 #include "tools/StreamText.h"
@@ -27,19 +27,13 @@ using analysis::StreamMoment;
 using analysis::StreamStory;
 using platform::linux_::StoreReader;
 
-bool matches(const std::vector<std::string>& patterns, const std::string& text) {
-  return std::ranges::any_of(patterns, [&](const std::string& pattern) {
-    return ::fnmatch(pattern.c_str(), text.c_str(), 0) == 0;
-  });
-}
-
 // Whether one of the comma-separated devices of a route, or all of them together, has that name.
 bool matchesOne(const std::vector<std::string>& patterns, const std::string& devices) {
   constexpr std::string_view kSeparator = ", ";
-  if (matches(patterns, devices)) return true;
+  if (matchesAnyGlob(patterns, devices)) return true;
   for (std::size_t begin = 0; begin < devices.size();) {
     const std::size_t end = std::min(devices.find(kSeparator, begin), devices.size());
-    if (matches(patterns, devices.substr(begin, end - begin))) return true;
+    if (matchesAnyGlob(patterns, devices.substr(begin, end - begin))) return true;
     begin = end + kSeparator.size();
   }
   return false;
@@ -50,7 +44,7 @@ bool isSelected(const ShowStreams& request, const StreamStory& story) {
   const bool isRunning = story.end == StreamEnd::kStillRunning;
   if (request.since && !isRunning && story.ended < *request.since) return false;
   if (request.until && story.started >= *request.until) return false;
-  if (!request.applications.empty() && !matches(request.applications, story.application)) {
+  if (!request.applications.empty() && !matchesAnyGlob(request.applications, story.application)) {
     return false;
   }
   return request.devices.empty() ||

@@ -1,11 +1,10 @@
 #include "tools/export/ApplicationFilter.h"
 
-#include <algorithm>
 #include <bit>
 
 #include "analysis/IssueMetric.h"
-#include <fnmatch.h>
 
+#include "tools/Globs.h"
 #include "tools/export/RecordKinds.h"
 
 namespace halvox::tools {
@@ -42,10 +41,7 @@ bool ApplicationFilter::accepts(const StoredItem& item) {
 }
 
 bool ApplicationFilter::matches(std::string_view application) const {
-  const std::string text(application);
-  return std::ranges::any_of(patterns_, [&](const std::string& pattern) {
-    return ::fnmatch(pattern.c_str(), text.c_str(), 0) == 0;
-  });
+  return matchesAnyGlob(patterns_, std::string(application));
 }
 
 bool ApplicationFilter::acceptsEvent(const StoredItem& item) {

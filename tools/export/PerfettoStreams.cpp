@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <functional>
 
-#include <fnmatch.h>
+#include "tools/Globs.h"
 
 namespace halvox::tools {
 namespace {
@@ -87,9 +87,7 @@ bool PerfettoStreams::isShownNow(const StreamStory& story, const StreamMoment& m
       moment.kind == StreamMoment::Kind::kXrun || moment.kind == StreamMoment::Kind::kEnded;
   if (story.application.empty() && !mustShow) return false;
   const auto& patterns = selection_.applications;
-  return patterns.empty() || std::ranges::any_of(patterns, [&](const std::string& pattern) {
-           return ::fnmatch(pattern.c_str(), story.application.c_str(), 0) == 0;
-         });
+  return patterns.empty() || matchesAnyGlob(patterns, story.application);
 }
 
 void PerfettoStreams::show(const StreamStory& story, Open& stream) {
