@@ -10,6 +10,7 @@
 #include "client/Vocabulary.h"
 #include "platform/linux/configuration/LinkBackendName.h"
 #include "platform/linux/store/EventNames.h"
+#include "tools/TimeText.h"
 
 namespace halvox::tools {
 namespace {
@@ -49,6 +50,15 @@ AudioServiceType serviceNumber(const std::string& service) {
 }
 
 }  // namespace
+
+std::string counted(std::uint64_t number, const char* one) {
+  return std::to_string(number) + " " + one + (number == 1 ? "" : "s");
+}
+
+std::string spanText(std::optional<double> first, std::optional<double> last) {
+  if (!first || !last) return {};
+  return ", from " + localTime(*first) + " to " + localTime(*last);
+}
 
 bool isMessageName(const MessageName& name) {
   return categoryNumber(name.category).has_value() &&

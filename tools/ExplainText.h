@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -23,6 +25,11 @@ struct ExplainSettings {
   platform::linux_::Configuration configuration;
   platform::linux_::StoreServer server{};
 };
+
+// "1 message", "2 messages".
+[[nodiscard]] std::string counted(std::uint64_t number, const char* one);
+// ", from 2026-11-21 22:44:05.123 to …", for seconds since 1970. Empty without a time.
+[[nodiscard]] std::string spanText(std::optional<double> first, std::optional<double> last);
 
 // Whether there can be messages of that category and type.
 [[nodiscard]] bool isMessageName(const MessageName& name);
