@@ -3,10 +3,9 @@
 #include <array>
 #include <charconv>
 #include <cmath>
-#include <cstdio>
-#include <ctime>
 
 #include "tools/JsonText.h"
+#include "tools/TimeText.h"
 
 namespace halvox::tools {
 namespace {
@@ -26,18 +25,8 @@ std::string timeNumber(double seconds) {
 
 std::string utcTime(double seconds) {
   if (!hasDate(seconds)) return {};
-  const double whole = std::floor(seconds);
-  const auto time = static_cast<std::time_t>(whole);
-  std::tm fields{};
-  std::array<char, 32> date{};
-  if (gmtime_r(&time, &fields) == nullptr ||
-      std::strftime(date.data(), date.size(), "%Y-%m-%dT%H:%M:%S", &fields) == 0) {
-    return {};
-  }
-  std::array<char, 8> fraction{};
-  std::snprintf(fraction.data(), fraction.size(), ".%03dZ",
-                static_cast<int>((seconds - whole) * 1000));
-  return std::string(date.data()) + fraction.data();
+  std::string time = utcClockTime(seconds);
+  return time.replace(time.find(' '), 1, 1, 'T');
 }
 
 }  // namespace halvox::tools
