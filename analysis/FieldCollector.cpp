@@ -5,6 +5,7 @@
 
 #include "analysis/MessageJoin.h"
 #include "analysis/MessageNames.h"
+#include "analysis/TwinEvents.h"
 #include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>
 
@@ -126,16 +127,17 @@ class FieldCollector::Values
 };
 
 void FieldCollector::add(const Record& record) {
-  if (record.kind == RecordKind::kIssueMetric || isTwin(record)) return;
+  if (record.kind == RecordKind::kIssueMetric || completesTwin(record)) return;
   Values(*this, record, placeOf(record)).read();
 }
 
-// The store has the two events of a message directly after each other.
-bool FieldCollector::isTwin(const Record& record) {
+bool FieldCollector::completesTwin(const Record& record) {
   if (record.kind != RecordKind::kEvent) return false;
   if (record.service != kCommonService) {
-    return std::exchange(lastEvent_.isThere, false) && record.type == lastEvent_.type &&
-           record.category == lastEvent_.category && record.payload->json() == lastEvent_.payload;
+    return std::exchange(lastEvent_.isThere, false) && isTwin({.category = lastEvent_.category,
+                                                               .type = lastEvent_.type,
+                                                               .payload = lastEvent_.payload},
+                                                              record);
   }
   lastEvent_.isThere = true;
   lastEvent_.category = record.category;

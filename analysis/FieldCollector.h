@@ -101,7 +101,7 @@ class FieldCollector {
   };
   class Values;  // receives the members of one payload from the parser
 
-  [[nodiscard]] bool isTwin(const Record& record);
+  [[nodiscard]] bool completesTwin(const Record& record);
   [[nodiscard]] std::size_t placeOf(const Record& record);
   [[nodiscard]] Entry* find(std::string_view key);
   void addValue(const Record& record, std::size_t place, std::string_view key, FieldType type,

@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "analysis/MessageNames.h"
+#include "analysis/TwinEvents.h"
 
 namespace halvox::analysis {
 namespace {
@@ -81,16 +82,15 @@ void MessageJoin::addEvent(const Record& record) {
   if (!isCommon) message->message.service = record.service;
 }
 
-// True if the record is the second event of a message. It follows the first one without another
-// event between them.
+// True if the record is the second event of a message.
 bool MessageJoin::completesTwin(const Record& record) {
   if (record.service == kCommonService || !lastEvent_) return false;
   Waiting* const last = waiting(*std::exchange(lastEvent_, std::nullopt));
-  if (last == nullptr || !last->hasCommon || last->message.type != record.type ||
-      last->message.category != record.category ||
-      last->message.payload != record.payload->json()) {
-    return false;
-  }
+  if (last == nullptr || !last->hasCommon) return false;
+  const TwinContent first{.category = last->message.category,
+                          .type = last->message.type,
+                          .payload = last->message.payload};
+  if (!isTwin(first, record)) return false;
   last->message.service = record.service;
   last->message.serviceID = record.id;
   last->isComplete = last->message.isLinkMessage || last->key == 0;
