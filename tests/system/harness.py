@@ -279,6 +279,16 @@ class Service(Startable):
         return voluntary_switches(self.process)
 
 
+def start_service(test, config=""):
+    """Starts a service for one test. Returns it and a client of it."""
+    service = Service(config)
+    service.__enter__()
+    test.addCleanup(service.__exit__)
+    client = service.client()
+    test.addCleanup(client.close)
+    return service, client
+
+
 def start_session(test, service, reporter):
     """Starts a session. Returns its client, which is closed after the test."""
     client = service.client()

@@ -3,7 +3,7 @@
 import json
 import unittest
 
-from harness import Service, wait_for
+from harness import start_service, wait_for
 
 SESSION_PLAYBACK, SESSION_GENERIC, VOLUME, ERROR = 0x08000004, 0x08000001, 14, 11
 START, STOP, ISSUE, JOULEBOOK, STATE = 1, 2, 7, 8, 18
@@ -14,11 +14,7 @@ class Explaining(unittest.TestCase):
     config = ""
 
     def setUp(self):
-        self.service = Service(self.config)
-        self.service.__enter__()
-        self.addCleanup(self.service.__exit__)
-        self.client = self.service.client()
-        self.addCleanup(self.client.close)
+        self.service, self.client = start_service(self, self.config)
 
     def session(self, reporter, service_type=LONG_FORM, application="player"):
         self.client.begin(reporter, service_type, application)

@@ -3,7 +3,7 @@
 import json
 import unittest
 
-from harness import Service, wait_for
+from harness import start_service, wait_for
 from terminal import lines_at_terminal
 
 VOLUME, STATE = 14, 18
@@ -13,11 +13,7 @@ HAPTICS, LONG_FORM = 3, 7
 
 class FieldsTest(unittest.TestCase):
     def setUp(self):
-        self.service = Service()
-        self.service.__enter__()
-        self.addCleanup(self.service.__exit__)
-        self.client = self.service.client()
-        self.addCleanup(self.client.close)
+        self.service, self.client = start_service(self)
         for session, service_type in ((7, LONG_FORM), (8, HAPTICS)):
             self.client.begin(session, service_type, f"org.app{session}")
         self.client.send({"gain": 0.5, "list": [1, 2]}, VOLUME, STATE, [7])

@@ -7,7 +7,7 @@ import sqlite3
 import subprocess
 import unittest
 
-from harness import CTL, DEADLINE, Service, connect_to_store, wait_for
+from harness import CTL, DEADLINE, connect_to_store, start_service, wait_for
 
 TABLES = ("analytics_events", "issue_metrics", "power_events", "link_messages", "snapshots")
 MESSAGES = 600
@@ -17,11 +17,7 @@ class QueriesTest(unittest.TestCase):
     """A service that runs and has stored messages of two sessions."""
 
     def setUp(self):
-        self.service = Service()
-        self.service.__enter__()
-        self.addCleanup(self.service.__exit__)
-        self.client = self.service.client()
-        self.addCleanup(self.client.close)
+        self.service, self.client = start_service(self)
         for session in (7, 8):
             self.client.begin(session, 7, f"org.app{session}")
         for number in range(MESSAGES):
