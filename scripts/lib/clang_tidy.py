@@ -10,8 +10,8 @@ because some checks look only at the main file.
   the concatenation has, the sources of the unit are read one by one, and only these findings count.
 - source_units.py decides which sources share a unit. What it misses, such as two classes of one name
   in headers of libraries, makes a unit that does not compile, which only costs time.
-- A use in one source hides an unused using-declaration in another. Sources with using-declarations
-  are therefore read a second time by themselves, with only that check.
+- A use in one source hides an unused using-declaration in another. A source is therefore read a second
+  time by itself, with only that check, if a name of its using-declarations occurs elsewhere in its unit.
 
     clang_tidy.py BUILD_DIRECTORY < names of sources, one a line
 
@@ -31,7 +31,7 @@ from source_units import Source, plan
 
 USING_CHECK = "misc-unused-using-decls"
 
-USING_DECLARATION = re.compile(r"\busing\s+(?:typename\s+)?(?:::)?\w+(?:::\w+)+\s*[;,]")
+USING_DECLARATION = re.compile(r"\busing\s+(?:typename\s+)?((?:::)?\w+(?:::\w+)+\s*[;,][^;]*)")
 
 
 def options_of(command):
@@ -62,6 +62,13 @@ def read_sources(build, paths):
             raise SystemExit(f"clang_tidy: {path} has no compile command in {build}")
         sources.append(Source(path, options, Path(path).read_text(encoding="utf-8")))
     return sources
+
+
+def may_be_hidden(source, unit):
+    """Whether another source of the unit may use a name of a using-declaration of this source."""
+    names = {name for text in USING_DECLARATION.findall(source.text)
+             for name in re.findall(r"(\w+)\s*(?:[;,]|$)", text)}
+    return any(not names.isdisjoint(other.words) for other in unit.sources if other is not source)
 
 
 def write_units(build, units):
@@ -115,7 +122,7 @@ def main():
                 second.append(pool.submit(tidy, build, unit.sources[0].path))
         for unit in units:
             for source in unit.sources:
-                if len(unit.sources) > 1 and USING_DECLARATION.search(source.text):
+                if may_be_hidden(source, unit):
                     second.append(pool.submit(tidy, build, source.path, f"--checks=-*,{USING_CHECK}"))
         for unit, result in first:
             if result.result() is not None:

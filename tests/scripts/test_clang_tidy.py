@@ -14,7 +14,7 @@ ROOT = Path(__file__).resolve().parents[2]
 SCRIPT = ROOT / "scripts/lib/clang_tidy.py"
 sys.path.insert(0, str(SCRIPT.parent))
 
-from clang_tidy import USING_CHECK, read_sources, tidy, write_units  # noqa: E402
+from clang_tidy import USING_CHECK, may_be_hidden, read_sources, tidy, write_units  # noqa: E402
 from source_units import plan  # noqa: E402
 
 CLEAN = "int %s(int value) { return value + 1; }\n"
@@ -140,6 +140,26 @@ class Findings(unittest.TestCase):
         self.assertEqual(run.returncode, 1, run)
         self.assertRegex(run.stdout, r"/a\.cpp:2:.*misc-unused-using-decls")
         self.assertNotIn("b.cpp:", run.stdout)
+
+    def test_an_unused_name_that_no_other_source_has_is_found_with_the_unit(self):
+        paths = self.write({
+            "a.cpp": "#include <utility>\nusing std::exchange, std::pair ;\n" + CLEAN % "first",
+            "b.cpp": "#include <vector>\nusing std::vector;\nvector<int> second() { return {1, 2}; }\n",
+        })
+        [unit] = plan(read_sources(self.build, paths))
+        self.assertEqual([may_be_hidden(source, unit) for source in unit.sources], [False, False])
+        run = self.run_script(paths)
+        self.assertRegex(run.stdout, r"/a\.cpp:2:.*'exchange'.*misc-unused-using-decls")
+        self.assertRegex(run.stdout, r"/a\.cpp:2:.*'pair'.*misc-unused-using-decls")
+        self.assertNotIn("b.cpp:", run.stdout)
+
+    def test_each_name_of_a_using_declaration_may_be_hidden(self):
+        paths = self.write({
+            "a.cpp": "#include <utility>\nusing std::exchange, std::pair ;\n" + CLEAN % "first",
+            "b.cpp": "#include <utility>\nstd::pair<int, int> second() { return {1, 2}; }\n",
+        })
+        [unit] = plan(read_sources(self.build, paths))
+        self.assertEqual([may_be_hidden(source, unit) for source in unit.sources], [True, False])
 
     def test_sources_without_findings_pass(self):
         run = self.run_script(self.write({"a.cpp": CLEAN % "first", "b.cpp": CLEAN % "second"}))
