@@ -147,16 +147,19 @@ class HVReportingClientServerInstance final
   struct OpenStop {
     std::shared_ptr<SessionStop> rest;
     platform::Job finished;
-    std::optional<platform::RequestToken> request{};  // of the request that is carried out then
+    std::optional<platform::RequestToken> request{};  // of the request that began the stop
   };
   // Stops a started session. Returns true if the stop is complete. Otherwise the session is stopped
   // for all other clients, but its summary file is still being written. This client's requests wait
   // until the file is complete and `finished` has run, on the reporting queue.
   [[nodiscard]] bool stop(const Session& session, platform::Job finished);
-  void writeNextFile();
-  void finishFirstStop();
-  [[nodiscard]] bool isStopping() const { return !stops_.empty(); }
-  // Keeps the job until the client's stops are complete.
+  void writeFile();
+  void finishStop();
+  [[nodiscard]] bool isStopping() const { return stop_.has_value(); }
+  // Stops these sessions, one after the other, from the position `next` on, and then releases all
+  // of them. The end of the clean-up.
+  void stopRemovedSessions(const std::shared_ptr<std::vector<Session>>& removed, std::size_t next);
+  // Keeps the job until the client's stop is complete.
   void postpone(platform::Job job);
   void carryOutPostponed();
 
@@ -185,7 +188,7 @@ class HVReportingClientServerInstance final
   Guarded<std::optional<std::string>> clientProcessName_;
   // Reporting queue only.
   SessionMap sessions_;
-  std::deque<OpenStop> stops_;           // the file of the first one is being written
+  std::optional<OpenStop> stop_;
   std::deque<platform::Job> postponed_;  // its requests and clean-up meanwhile
   Messages posted_;                      // connection's thread only; not queued yet
 };

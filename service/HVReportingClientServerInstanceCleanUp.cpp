@@ -43,29 +43,24 @@ void writeParts(const std::shared_ptr<platform::DispatchQueue>& queue,
 // do not wait: for them the session is stopped when this returns, as if the whole stop had been
 // carried out now. They cannot see how long a stop takes: the file, the event and the replies have
 // no order with what other clients do.
-//
-// The files of one client are written one after the other, each with the rest of its stop, although
-// a client that disconnects stops all its sessions at once. A client with many sessions then delays
-// the files of others by one part of a file at most.
 bool HVReportingClientServerInstance::stop(const Session& session, platform::Job finished) {
   const std::shared_ptr<SessionStop> rest = session->beginStop();
   if (rest == nullptr) return true;
-  stops_.push_back({.rest = rest, .finished = std::move(finished)});
-  if (stops_.size() == 1) writeNextFile();
+  stop_ = OpenStop{.rest = rest, .finished = std::move(finished)};
+  writeFile();
   return false;
 }
 
 // The queue has the quality of requests, because a request waits for it. Each file has a queue of
 // its own: the pool has two threads, and the files of several clients take turns.
-void HVReportingClientServerInstance::writeNextFile() {
+void HVReportingClientServerInstance::writeFile() {
   const auto queue = platform::dispatch().createSerialQueue(
       kFileQueueLabel, platform::QualityOfService::kUserInteractive,
       platform::QueueThreading::kShared);
-  writeParts(queue, stops_.front().rest,
-             [client = shared_from_this()] { client->finishFirstStop(); });
+  writeParts(queue, stop_->rest, [client = shared_from_this()] { client->finishStop(); });
 }
 
-void HVReportingClientServerInstance::finishFirstStop() {
+void HVReportingClientServerInstance::finishStop() {
   std::exception_ptr failure;
   const auto carryOut = [&](const auto& step) {
     try {
@@ -74,27 +69,22 @@ void HVReportingClientServerInstance::finishFirstStop() {
       if (!failure) failure = std::current_exception();
     }
   };
-  // Each step is carried out after a failure of the one before, because a client would be kept for
-  // ever whose stops and clean-up do not go on.
+  // Each step is carried out after a failure of the one before, because the client's requests and
+  // its clean-up would otherwise wait for ever.
   {
-    const OpenStop stop = std::move(stops_.front());
-    stops_.pop_front();
+    const OpenStop stop = *std::exchange(stop_, std::nullopt);
     carryOut([&] { stop.rest->finish(); });
-    if (stop.finished) carryOut(stop.finished);
+    carryOut(stop.finished);
     if (stop.request.has_value()) counters_->requests.carriedOut.add();
   }
-  if (isStopping()) {
-    writeNextFile();
-  } else {
-    carryOutPostponed();
-  }
+  carryOutPostponed();
   if (failure) std::rethrow_exception(failure);
 }
 
 void HVReportingClientServerInstance::noteCarriedOut(platform::RequestToken token) {
   // No request is carried out during a stop. If there is one now, this request has begun it.
   if (isStopping()) {
-    stops_.back().request = std::move(token);
+    stop_->request = std::move(token);
   } else {
     counters_->requests.carriedOut.add();
   }
@@ -151,8 +141,8 @@ void HVReportingClientServerInstance::handleConnectionError() {
 }
 
 void HVReportingClientServerInstance::carryOutConnectionError() {
-  // Requests that wait for a stop arrived before the end of the connection.
-  if (isStopping() && !postponed_.empty()) {
+  // What the client asked for before the end of its connection is carried out first.
+  if (isStopping()) {
     return postpone([client = shared_from_this()] { client->carryOutConnectionError(); });
   }
   const Delegate delegate = delegate_.lock();
@@ -161,24 +151,29 @@ void HVReportingClientServerInstance::carryOutConnectionError() {
   // removed and does nothing.
   const auto& clients = delegate->getAllClients();
   if (std::ranges::none_of(clients, [this](const auto& one) { return one.get() == this; })) return;
-  // As for a destroyed session, the counter of active sessions does not change and held replies are
-  // dropped. Both are required.
-  std::vector<Session> dropped;
-  for (const auto& [reporterID, session] : sessions_) {
-    dropped.push_back(session);
-    if (session->started()) static_cast<void>(stop(session, {}));
-  }
   // Other clients must not observe how long the files take: from here on they find neither the
   // sessions nor the client.
+  const auto removed = std::make_shared<std::vector<Session>>();
+  for (const auto& [reporterID, session] : sessions_) removed->push_back(session);
   while (!sessions_.empty()) removeSession(sessions_.begin(), delegate);
   delegate->removeClient(*this);
-  // Sessions are released, and the line is logged, only after all sessions have been stopped. This
-  // order is required.
-  auto end = [this, dropped = std::move(dropped)]() mutable {
-    dropped.clear();
-    kServiceLog.notice("removing ", processIdentifier_, " from the server client list");
-  };
-  isStopping() ? postpone(std::move(end)) : end();
+  stopRemovedSessions(removed, 0);
+}
+
+// As for a destroyed session, the counter of active sessions does not change and held replies are
+// dropped. Sessions are released, and the line is logged, only after all of them have been stopped.
+// All three are required.
+void HVReportingClientServerInstance::stopRemovedSessions(
+    const std::shared_ptr<std::vector<Session>>& removed, std::size_t next) {
+  while (next < removed->size()) {
+    const Session& session = (*removed)[next++];
+    if (!session->started()) continue;
+    const bool isComplete =
+        stop(session, [this, removed, next] { stopRemovedSessions(removed, next); });
+    if (!isComplete) return;
+  }
+  removed->clear();
+  kServiceLog.notice("removing ", processIdentifier_, " from the server client list");
 }
 
 }  // namespace halvox

@@ -192,21 +192,44 @@ TEST_F(HVReportingClientServerInstanceSummaryFileTest,
   run();
 }
 
+TEST_F(HVReportingClientServerInstanceSummaryFileTest, TheCleanUpStopsOneSessionAfterTheOther) {
+  startLong(8, AudioServiceType::kAlarms);
+
+  client_->invalidate();
+  run();
+
+  EXPECT_LT(at("ending session 7"), at("sending summary event for reporter 7"));
+  EXPECT_LT(at("sending summary event for reporter 7"), at("ending session 8"));
+  EXPECT_LT(at("ending session 8"), at("sending summary event for reporter 8"));
+  EXPECT_LT(at("sending summary event for reporter 8"),
+            at("removing 100 from the server client list"));
+}
+
+// The name of a file has the time of its stop. Sessions of one type differ in nothing else.
+TEST_F(HVReportingClientServerInstanceSummaryFileTest, FilesThatTakeASecondHaveDifferentNames) {
+  startLong(8, AudioServiceType::kHaptics);
+
+  client_->invalidate();
+  while (platform_.files.files().empty() && platform_.dispatch.runOne()) {
+  }
+  platform_.clock.advance(std::chrono::seconds(1));
+  run();
+
+  EXPECT_THAT(platform_.files.files(), SizeIs(2));
+}
+
 TEST_F(HVReportingClientServerInstanceSummaryFileTest,
-       AClientThatDisconnectsDuringAStopHasNoSessionsAnyMore) {
+       AClientThatDisconnectsDuringAStopIsRemovedAfterIt) {
   startLong(8, AudioServiceType::kAlarms);
   const Call stop = beginStop(7);
 
   client_->invalidate();
-  const Call request = post(other_, "getAllReporters", {});
-  runUntilAnswered(request);
-  EXPECT_EQ(request->value(), Value(Array{}));
-  EXPECT_THAT(delegate_->getAllActiveReportingSessions(), IsEmpty());
-  EXPECT_THAT(platform_.files.files(), IsEmpty());
   run();
 
   EXPECT_THAT(platform_.files.files(), SizeIs(2));
-  EXPECT_LT(at("stopping 7"), at("sending summary event for reporter 8"));
+  EXPECT_EQ(stop->value(), Value(true));
+  EXPECT_LT(at("1 active reporting session(s) "), at("stopping 7"));
+  EXPECT_LT(at("stopping 7"), at("ending session 8"));
   EXPECT_LT(at("sending summary event for reporter 8"),
             at("removing 100 from the server client list"));
 }
