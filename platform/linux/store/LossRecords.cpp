@@ -9,20 +9,20 @@
 namespace halvox::platform::linux_ {
 
 LossRecords::LossRecords(StatisticsService& statistics, const ClockService& clock)
-    : statistics_(statistics),
+    : KindWithSpans(kLosses.records, kLosses.spans),
+      statistics_(statistics),
       clock_(clock),
-      spans_(kLosses.records, kLosses.spans),
       lastTime_(clock.currentDate().secondsSince1970) {}
 
 SqliteCode LossRecords::prepare(Database& database) {
-  const SqliteCode code = spans_.prepare(database);
+  const SqliteCode code = spans().prepare(database);
   if (code != SQLITE_OK) return code;
   return database.prepare("INSERT INTO loss_records VALUES (?1, ?2, ?3, ?4, ?5)", insert_);
 }
 
 void LossRecords::release() {
   insert_ = {};
-  spans_.release();
+  spans().release();
 }
 
 void LossRecords::finish() { isFinishing_ = !grown().empty(); }
@@ -55,30 +55,30 @@ SqliteCode LossRecords::write(TransactionAllowance& /*allowance*/) {
     const SqliteCode code = writeRow(loss, now);
     if (code != SQLITE_OK) return code;
   }
-  return spans_.flush();
+  return spans().flush();
 }
 
 SqliteCode LossRecords::writeRow(const Loss& loss, double now) {
-  insert_.bind(1, spans_.next());
+  insert_.bind(1, spans().next());
   insert_.bind(2, now);
   insert_.bind(3, std::string_view(loss.name.first));
   insert_.bind(4, std::string_view(loss.name.second));
   insert_.bind(5, static_cast<std::int64_t>(loss.count));
   SqliteCode code = insert_.run();
-  if (code == SQLITE_OK) code = spans_.note(now);
-  spans_.advance();
+  if (code == SQLITE_OK) code = spans().note(now);
+  spans().advance();
   return code;
 }
 
 void LossRecords::onCommitted(FinishedRecords& /*finished*/) {
-  spans_.onCommitted();
+  spans().onCommitted();
   for (const Loss& loss : written_) recorded_[loss.name] = loss.total;
   written_.clear();
   if (writtenAt_) lastTime_ = *std::exchange(writtenAt_, std::nullopt);
 }
 
 std::uint64_t LossRecords::dropTaken(DropReason /*reason*/, FinishedRecords& /*finished*/) {
-  spans_.onRolledBack();
+  spans().onRolledBack();
   written_.clear();
   writtenAt_ = std::nullopt;
   isFinishing_ = false;

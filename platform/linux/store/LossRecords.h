@@ -8,8 +8,7 @@
 #include <vector>
 
 #include "platform/clock.h"
-#include "platform/linux/store/RecordKind.h"
-#include "platform/linux/store/RecordSpans.h"
+#include "platform/linux/store/KindWithSpans.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
@@ -23,7 +22,7 @@ namespace halvox::platform::linux_ {
 // transaction that fails come with the next one, and counts after the last transaction are lost.
 //
 // Threads, owner and failures are those of RecordKind.
-class LossRecords final : public RecordKind {
+class LossRecords final : public KindWithSpans {
  public:
   // How long counts are gathered.
   static constexpr double kSecondsBetween = 60;
@@ -41,13 +40,6 @@ class LossRecords final : public RecordKind {
   [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) override;
   void onCommitted(FinishedRecords& finished) override;
   std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) override;
-  [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) override {
-    return spans_.oldestTime(time);
-  }
-  [[nodiscard]] SqliteCode deleteOldest(bool& found) override { return spans_.deleteOldest(found); }
-  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) override {
-    return spans_.deleteOlderThan(time, found);
-  }
 
  private:
   using Name = std::pair<std::string, std::string>;  // piece and name of a counter
@@ -63,7 +55,6 @@ class LossRecords final : public RecordKind {
 
   StatisticsService& statistics_;
   const ClockService& clock_;
-  RecordSpans spans_;
   Statement insert_;
   std::map<Name, std::uint64_t> recorded_;  // the totals that the store has
   std::vector<Loss> written_;               // in the open transaction

@@ -7,7 +7,7 @@ SqliteCode SpannedRecordKind::write(TransactionAllowance& allowance) {
     const SqliteCode code = writeNext(allowance);
     if (code != SQLITE_OK) return code;
   }
-  return spans_.flush();
+  return spans().flush();
 }
 
 bool SpannedRecordKind::charge(TransactionAllowance& allowance, std::uint64_t records,
@@ -24,7 +24,7 @@ bool SpannedRecordKind::charge(TransactionAllowance& allowance, std::uint64_t re
 }
 
 void SpannedRecordKind::onCommitted(FinishedRecords& finished) {
-  spans_.onCommitted();
+  spans().onCommitted();
   counters_.addStored(written_ - tooLarge_);
   endTransaction(finished);
 }
@@ -44,7 +44,7 @@ void SpannedRecordKind::endTransaction(FinishedRecords& finished) {
 }
 
 std::uint64_t SpannedRecordKind::dropTaken(DropReason reason, FinishedRecords& finished) {
-  spans_.onRolledBack();
+  spans().onRolledBack();
   const std::uint64_t unwritten = forgetTaken();
   const std::uint64_t dropped = written_ - tooLarge_ + unwritten;
   counters_.addDropped(reason, dropped);

@@ -2,35 +2,25 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <optional>
 #include <string_view>
 #include <utility>
 
+#include "platform/linux/store/KindWithSpans.h"
 #include "platform/linux/store/PayloadEncoder.h"
 #include "platform/linux/store/RecordCounters.h"
-#include "platform/linux/store/RecordKind.h"
-#include "platform/linux/store/RecordSpans.h"
 #include "platform/linux/store/StoreLog.h"
 #include "platform/linux/store/WriterQueue.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
 
-// The part of SimpleRecords that concerns the numbers and spans of records, the length that a
-// payload may have, and the counts of the open transaction. Threads, owner and failures are those
-// of RecordKind.
-class SpannedRecordKind : public RecordKind {
+// The part of SimpleRecords that concerns the length that a payload may have, and the counts of the
+// open transaction. Threads, owner and failures are those of RecordKind.
+class SpannedRecordKind : public KindWithSpans {
  public:
   [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) final;
   void onCommitted(FinishedRecords& finished) final;
   std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) final;
-  [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) final {
-    return spans_.oldestTime(time);
-  }
-  [[nodiscard]] SqliteCode deleteOldest(bool& found) final { return spans_.deleteOldest(found); }
-  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) final {
-    return spans_.deleteOlderThan(time, found);
-  }
 
  protected:
   // Pass constants, because the names are not copied.
@@ -43,10 +33,10 @@ class SpannedRecordKind : public RecordKind {
   // Does not own its arguments, which must outlive it. `longestPayload` is in bytes.
   SpannedRecordKind(const Names& names, WriterQueue& queue, StatisticsService& statistics,
                     std::uint64_t longestPayload)
-      : queue_(queue),
+      : KindWithSpans(names.records, names.spans),
+        queue_(queue),
         counters_(statistics, names.piece),
-        longestPayload_(longestPayload),
-        spans_(names.records, names.spans) {}
+        longestPayload_(longestPayload) {}
 
   // Waits for room in the queue, then runs `append`, which queues one record. If the store is
   // closed, counts the record as dropped and returns false.
@@ -65,7 +55,6 @@ class SpannedRecordKind : public RecordKind {
   [[nodiscard]] bool charge(TransactionAllowance& allowance, std::uint64_t records,
                             std::size_t payloadBytes);
 
-  [[nodiscard]] RecordSpans& spans() { return spans_; }
   [[nodiscard]] PayloadEncoder& encoder() { return encoder_; }
 
  private:
@@ -84,7 +73,6 @@ class SpannedRecordKind : public RecordKind {
 
   // Used by the writer's thread only.
   PayloadEncoder encoder_;
-  RecordSpans spans_;
   std::uint64_t written_ = 0;       // records in the open transaction, including tooLarge_
   std::uint64_t writtenBytes_ = 0;  // the length of their payloads
   std::uint64_t tooLarge_ = 0;      // records among written_ that were dropped for their length
