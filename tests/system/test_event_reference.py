@@ -4,6 +4,7 @@ import contextlib
 import json
 import signal
 import sys
+import time
 import unittest
 from pathlib import Path
 
@@ -73,7 +74,11 @@ class EventReferenceTest(unittest.TestCase):
         recorder = self.audio.run("pw-record", "-P", "{ stream.capture.sink=true }",
                                   self.audio.directory / "out.wav")
         self.stack.callback(stop_process, recorder)
-        self.wait_for_events("Volume.State", "Session_Record.Start", "RouteChange.State")
+        self.wait_for_events("Volume.State")
+        began = time.monotonic()
+        self.wait_for_events("Session_Record.Start", "RouteChange.State")
+        # Only a time of more than half a second at one volume is summarised.
+        wait_for("the time at that volume", lambda: time.monotonic() - began > 0.6)
         control = self.audio.run("pw-cli", "s", "pw-play", "Props", "{ volume: 0.25 }")
         self.assertEqual(control.wait(DEADLINE), 0)
         player.send_signal(signal.SIGSTOP)
