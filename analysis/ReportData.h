@@ -23,7 +23,7 @@ struct ReportBounds {
   std::size_t xruns = 2000;    // those that lost most
   std::size_t contexts = 200;  // xruns with the messages around them
   std::size_t around = 10;     // messages before and after an xrun
-  // Of the contents of all those messages, which would otherwise be most of a page.
+  // Bytes of content of all messages around xruns. Without a bound they would be most of the page.
   std::size_t aroundBytes = 1'500'000;
   std::size_t marks = 500;    // changed settings and captures
   std::size_t rows = 500;     // of each table of sums
@@ -35,7 +35,7 @@ struct ReportBounds {
   std::size_t payload = 1024;  // bytes of a message's content
 };
 
-// From then on the stream had this volume. Without one, the client told none.
+// From then on the stream had this volume. Without one, the client did not report one.
 struct VolumeStep {
   double time = 0;
   std::optional<double> volume{};
@@ -63,9 +63,9 @@ struct ReportXrun {
   std::optional<std::int64_t> storyID{};  // of the stream; nothing if it belongs to none
   std::string device{};                   // the description of the route, else the node's name
   double milliseconds = 0;
-  std::uint64_t missedCycles = 0;  // 0: not told
-  std::int64_t quantum = 0;        // samples; 0: not told
-  std::int64_t rate = 0;           // samples a second; 0: not told
+  std::uint64_t missedCycles = 0;  // 0: not reported
+  std::int64_t quantum = 0;        // samples; 0: not reported
+  std::int64_t rate = 0;           // samples a second; 0: not reported
   std::string role{};              // "culprit", "victim", "device", or empty
   std::string late{};              // the node that was late, with its process; may be empty
   std::vector<std::shared_ptr<const ReportMessage>>

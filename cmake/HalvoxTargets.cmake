@@ -6,7 +6,8 @@ if(HALVOX_CCACHE)
   set(CMAKE_CXX_COMPILER_LAUNCHER ${HALVOX_CCACHE})
 endif()
 
-# Packages switch this off: a compiler or hardening options that we do not build with warn of more.
+# Package builds turn this off: other compilers and hardening options cause warnings that we have not
+# seen.
 option(HALVOX_WERROR "Treat warnings as errors" ON)
 add_library(halvox_flags INTERFACE)
 target_compile_options(halvox_flags INTERFACE
@@ -35,9 +36,8 @@ else()
   set(HALVOX_SYSTEM_TEST_SECONDS 300)
 endif()
 
-# `ctest --parallel N` fills N slots. A system test uses a tenth of a processor, because it waits for
-# other programs, and takes one slot. A test that computes takes two. Two processors are therefore
-# kept busy, and not overloaded, by four slots.
+# `ctest --parallel N` fills N slots. A system test mostly waits for other programs and takes one slot;
+# a test that computes takes two. Four slots keep two processors busy.
 set(HALVOX_BUSY_TEST_SLOTS 2)
 
 # What guides the fuzzers: code in the libraries and in the fuzzers that records where it has been.

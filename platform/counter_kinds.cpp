@@ -21,8 +21,8 @@ struct Entry {
   Part part = Part::kWhole;
 };
 
-// Names decide, and not words in them: "connections closed" is a loss only with its reasons, and a
-// file that was "let go unfinished" is one without any.
+// Compare whole names, not words: "connections closed" is a loss only with certain reasons, and
+// "let go unfinished" is always one.
 constexpr std::array kTable{
     // messages, records and other items that pieces take and pass on
     Entry{"received", kProgress},

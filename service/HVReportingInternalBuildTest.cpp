@@ -56,8 +56,8 @@ TEST_F(HVReportingInternalBuildTest, TheDelegateMakesOneStateManager) {
   EXPECT_EQ(delegate_->vekStateManager()->leakedHapticsSessionCounter(), 0U);
 }
 
-// Losses are recorded and shown by the kinds of their counters. A counter whose name has no kind
-// would never be one. An internal build has all counters of the inner ring.
+// Losses are recorded and shown by the kinds of their counters. A counter without a kind is never
+// recorded as a loss. An internal build has all counters of the inner ring.
 TEST_F(HVReportingInternalBuildTest, EveryCounterOfTheServiceHasAKind) {
   reportToSeven(30);
 

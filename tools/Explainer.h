@@ -25,7 +25,7 @@ namespace halvox::tools {
 // request. `request`, `complain` and `reader` must outlive it. Reports a failure to `complain`.
 class Explainer {
  public:
-  // What a number may stand for.
+  // What a number on the command line may mean.
   struct Found {
     struct Target {
       std::string name;

@@ -108,7 +108,7 @@ ExitStatus showStreams(const ShowStreams& request, OutputForm form, std::ostream
     for (const auto& [started, story] : stories) out << streamJson(story) << '\n';
   } else {
     TextTable table(streamColumns());
-    // The table holds its rows: each story goes when it has become one.
+    // Drop each story when its row is made: holding both took half as much memory again.
     for (auto next = stories.begin(); next != stories.end(); next = stories.erase(next)) {
       table.add(streamRow(next->second));
     }

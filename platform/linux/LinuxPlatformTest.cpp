@@ -12,8 +12,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Losses are recorded and shown by the kinds of their counters. A counter whose name has no kind
-// would never be one.
+// Losses are recorded and shown by the kinds of their counters. A counter without a kind is never
+// recorded as a loss.
 TEST(LinuxPlatformTest, EveryCounterOfTheAdaptersHasAKind) {
   const ScratchDirectory scratch;
   Configuration configuration;

@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
-# Installs the missing ones of some Debian packages and prints their names, for a script that needs
-# them: install-packages.sh SCRIPT PACKAGE... Does nothing if all are installed. The lines that it prints
+# Installs those of the given Debian packages that are missing, and prints their names:
+# install-packages.sh SCRIPT PACKAGE... Does nothing if all are installed. The lines that it prints
 # begin with the name of the script.
 set -euo pipefail
 if (($# < 2)); then

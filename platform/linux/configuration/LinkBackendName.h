@@ -4,7 +4,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Returns the word for a back-end in the setting link.backend.
+// Returns the value of link.backend that selects this back-end.
 [[nodiscard]] const char* linkBackendName(LinkBackend backend);
 
 }  // namespace halvox::platform::linux_

@@ -274,7 +274,7 @@ TEST_F(AsioDispatchServiceTest, FinishWaitsForJobsThatJobsAddToOtherQueues) {
   std::atomic<bool> hasEnded{false};
   shared->async(JobWeight::kMayBlock, [&] {
     own->async(JobWeight::kMayBlock, [&] {
-      // Without a job in the shared queue meanwhile, which finish() must not take for the end.
+      // The shared queue is empty here. finish() must still wait.
       never.get_future().wait_for(std::chrono::milliseconds(100));
       shared->async(JobWeight::kMayBlock, [&] { hasEnded = true; });
     });
