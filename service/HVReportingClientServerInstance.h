@@ -156,9 +156,11 @@ class HVReportingClientServerInstance final
   void writeFile();
   void finishStop();
   [[nodiscard]] bool isStopping() const { return stop_.has_value(); }
-  // Stops these sessions, one after the other, from the position `next` on, and then releases all
-  // of them. The end of the clean-up.
-  void stopRemovedSessions(const std::shared_ptr<std::vector<Session>>& removed, std::size_t next);
+  // Stops these sessions, one after the other, from the position `next` on. Returns true if all
+  // stops are complete. Otherwise goes on when the file is complete, and then ends the clean-up.
+  [[nodiscard]] bool stopSessions(const std::shared_ptr<std::vector<Session>>& sessions,
+                                  std::size_t next);
+  void endCleanUp(std::vector<Session>& sessions) const;
   // Keeps the job until the client's stop is complete.
   void postpone(platform::Job job);
   void carryOutPostponed();

@@ -151,28 +151,35 @@ void HVReportingClientServerInstance::carryOutConnectionError() {
   // removed and does nothing.
   const auto& clients = delegate->getAllClients();
   if (std::ranges::none_of(clients, [this](const auto& one) { return one.get() == this; })) return;
-  // Other clients must not observe how long the files take: from here on they find neither the
-  // sessions nor the client.
-  const auto removed = std::make_shared<std::vector<Session>>();
-  for (const auto& [reporterID, session] : sessions_) removed->push_back(session);
+  const auto stopped = std::make_shared<std::vector<Session>>();
+  for (const auto& [reporterID, session] : sessions_) stopped->push_back(session);
+  const bool isComplete = stopSessions(stopped, 0);
+  // Sessions are removed after their stop; this order is required. If a file is still being
+  // written, they are removed now: other clients must not observe how long it takes.
   while (!sessions_.empty()) removeSession(sessions_.begin(), delegate);
   delegate->removeClient(*this);
-  stopRemovedSessions(removed, 0);
+  if (isComplete) endCleanUp(*stopped);
 }
 
 // As for a destroyed session, the counter of active sessions does not change and held replies are
-// dropped. Sessions are released, and the line is logged, only after all of them have been stopped.
-// All three are required.
-void HVReportingClientServerInstance::stopRemovedSessions(
-    const std::shared_ptr<std::vector<Session>>& removed, std::size_t next) {
-  while (next < removed->size()) {
-    const Session& session = (*removed)[next++];
+// dropped. Both are required.
+bool HVReportingClientServerInstance::stopSessions(
+    const std::shared_ptr<std::vector<Session>>& sessions, std::size_t next) {
+  while (next < sessions->size()) {
+    const Session& session = (*sessions)[next++];
     if (!session->started()) continue;
-    const bool isComplete =
-        stop(session, [this, removed, next] { stopRemovedSessions(removed, next); });
-    if (!isComplete) return;
+    const bool isComplete = stop(session, [this, sessions, next] {
+      if (stopSessions(sessions, next)) endCleanUp(*sessions);
+    });
+    if (!isComplete) return false;
   }
-  removed->clear();
+  return true;
+}
+
+// Sessions are released, and the line is logged, only after all of them have been stopped. This
+// order is required.
+void HVReportingClientServerInstance::endCleanUp(std::vector<Session>& sessions) const {
+  sessions.clear();
   kServiceLog.notice("removing ", processIdentifier_, " from the server client list");
 }
 
