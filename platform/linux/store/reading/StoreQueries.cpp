@@ -68,6 +68,9 @@ Result<void, StoreError> StoreQueries::open(const std::filesystem::path& directo
       database.prepare("SELECT 1 FROM halvox_events, halvox_links", tables) != SQLITE_OK) {
     return Failure<StoreError>{StoreError::kCannotOpen, database.errorText()};
   }
+  // Those of JSON too. An SQLite without them says so when a query names one.
+  static_cast<void>(
+      database.prepare("SELECT 1 FROM json_each('[]') AS one, json_tree('[]') AS two", tables));
   sqlite3_set_authorizer(database.get(), authorize, nullptr);
   return {};
 }

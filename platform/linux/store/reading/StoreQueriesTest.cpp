@@ -80,6 +80,14 @@ TEST_F(StoreQueriesTest, ReadsTheApplicationsOfEvents) {
   EXPECT_THAT(ask("SELECT application AS a FROM halvox_events"), ElementsAre("a|", "org.app|"));
 }
 
+TEST_F(StoreQueriesTest, TakesPayloadsApartWithTheTablesOfJson) {
+  start();
+  openQueries();
+  EXPECT_THAT(ask("SELECT key, value FROM json_each('{\"a\": 1}')"),
+              ElementsAre("key|value|", "a|1|"));
+  EXPECT_THAT(ask("SELECT path FROM json_tree('[2]') WHERE atom = 2"), ElementsAre("path|", "$|"));
+}
+
 TEST_F(StoreQueriesTest, GivesEachValueItsType) {
   start();
   stop();
