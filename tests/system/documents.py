@@ -33,6 +33,11 @@ class Block:
         return self.mark not in ("not run", "output")
 
 
+def is_question(block):
+    """Whether the block only asks what is stored, and may therefore be run again."""
+    return block.language == "sh" and re.match(r"halvoxctl (events|sql|streams)\b", block.code) is not None
+
+
 def documents():
     listed = subprocess.run(["git", "ls-files", "--cached", "--others", "--exclude-standard", "*.md"],
                             cwd=ROOT, check=True, capture_output=True, text=True)

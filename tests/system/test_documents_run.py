@@ -3,6 +3,7 @@ service."""
 
 import json
 import os
+import re
 import shutil
 import subprocess
 import tempfile
@@ -95,7 +96,8 @@ class DocumentsTest(Installation):
         self.world = World(self)
         if not os.environ.get("HALVOX_SANITIZE"):
             self.world.environment.update(
-                CMAKE_PREFIX_PATH=str(self.prefix), PKG_CONFIG_PATH=str(self.libraries / "pkgconfig"), LD_LIBRARY_PATH=str(self.libraries))
+                CMAKE_PREFIX_PATH=str(self.prefix), LD_LIBRARY_PATH=str(self.libraries),
+                PKG_CONFIG_PATH=str(self.libraries / "pkgconfig"))
         for source in (self.prefix / "share/doc/halvox/examples").iterdir():
             copy = shutil.copytree if source.is_dir() else shutil.copy
             copy(source, self.world.home / source.name)
@@ -107,17 +109,27 @@ class DocumentsTest(Installation):
             code = code.replace(place, str(here))
         return code
 
+    def check_output(self, asked, expected, printed):
+        """Compares what was printed. A question about the store is asked again: the service may need
+        half a second to store what it has answered."""
+        if asked is None:
+            self.assertTrue(documents.matches(expected.code, printed), f"printed:\n{printed}")
+        else:
+            wait_for(f"the expected answer, not\n{printed}", lambda: documents.matches(
+                expected.code, self.run_sh(self.in_scratch(asked), expected)))
+
     def check_document(self, path):
-        printed = None
+        printed = asked = None
         for block in documents.blocks(path):
             with self.subTest(block.place):
                 self.assertNotEqual(block.language, "", "the block does not say its language")
                 if block.mark == "output":
                     self.assertIsNotNone(printed, "no block before it was run")
-                    self.assertTrue(documents.matches(block.code, printed), f"printed:\n{printed}")
+                    self.check_output(asked, block, printed)
                 if not block.is_run:
                     continue
                 printed = None
+                asked = block.code if documents.is_question(block) else None
                 self.skip_without_programs(block.code)
                 if block.mark == "file":
                     (self.world.home / block.value).write_text(self.in_scratch(block.code))
@@ -219,6 +231,16 @@ class CommandsTest(unittest.TestCase):
         self.assertGreater(checked, 20)
 
 
+class ReferenceTest(unittest.TestCase):
+    def test_the_numbers_of_the_protocol_are_those_of_the_vocabulary(self):
+        page = (ROOT / "docs/reference/protocol.md").read_text()
+        shown = re.findall(r"\| (0x[0-9a-f]+|\d+) \| (\w+)(?= \|)", page)
+        known = re.findall(r'\{"(\w+)", (0x\w+|\d+)\}', (ROOT / "client/Vocabulary.cpp").read_text())
+
+        self.assertEqual(len(known), 55)
+        self.assertEqual(sorted(shown), sorted((number, name) for name, number in known))
+
+
 class ParserTest(unittest.TestCase):
     def blocks(self, text):
         with tempfile.TemporaryDirectory() as directory:
@@ -228,7 +250,8 @@ class ParserTest(unittest.TestCase):
 
     def test_marks_belong_to_the_block_below(self):
         first, second, third = self.blocks(
-            "<!-- file: a.c -->\n```c\nint x;\n```\n\n```sh\ntrue\n```\n<!-- not run: slow -->\n```sh\nx\n```\n")
+            "<!-- file: a.c -->\n```c\nint x;\n```\n\n```sh\ntrue\n```\n"
+            "<!-- not run: slow -->\n```sh\nx\n```\n")
 
         self.assertEqual((first.mark, first.value, first.code), ("file", "a.c", "int x;\n"))
         self.assertEqual((second.place, second.mark, second.is_run), ("page.md:6", "", True))
