@@ -1,7 +1,6 @@
 """What the documents tell readers to run works: each code block and each command, against the real
 service."""
 
-import json
 import os
 import re
 import shutil
@@ -9,27 +8,23 @@ import subprocess
 import tempfile
 import time
 import unittest
-import xml.etree.ElementTree as ElementTree
 from pathlib import Path
 
 import documents
+from document_runner import DocumentRunner, Place
 from documents import ROOT
-from harness import BIN, CTL, DEADLINE, STORE_EXTENSION, Service, wait_for
-from installation import Installation, run
+from harness import BIN, CTL, DEADLINE, Service, wait_for
+from installation import Installation
 from player import PLAYBACK, STATE, begin_stream
 
 VOLUME, ERROR, ISSUE, JOULEBOOK, STOP, START = 14, 11, 7, 8, 2, 1
-# Blocks that name one of these programs are skipped where it is missing.
-PROGRAMS = ("busctl", "gdbus-codegen", "jq", "pkg-config", "sqlite3")
-# Words in code that builds programs with the library.
-BUILDING = ("pkg-config", "find_package", "cmake")
 PULSES = """# TYPE pulses counter
 pulses_total{{driver="ExampleActuator",group="Haptics",subgroup="Stats"}} {}
 # EOF
 """
 
 
-class World:
+class World(Place):
     """A service with the places of a user's own one, and records of some playing."""
 
     def __init__(self, test):
@@ -82,16 +77,8 @@ class World:
         wait_for("both clients' ends", lambda: any("clientuptime" in name
                                                    for name, _ in self.service.all_events()))
 
-    def run(self, *command, code=None):
-        """Runs a command in the home directory. Returns what it prints on standard output."""
-        done = subprocess.run(command, capture_output=True, text=True, check=False, timeout=DEADLINE,
-                              input=code, cwd=self.home, env=self.environment)
-        if done.returncode != 0:
-            raise AssertionError(f"exit status {done.returncode}: {done.stderr}{done.stdout}")
-        return done.stdout
 
-
-class DocumentsTest(Installation):
+class DocumentsTest(DocumentRunner, Installation):
     """A method for each document is added below."""
 
     def setUp(self):
@@ -104,117 +91,14 @@ class DocumentsTest(Installation):
             copy = shutil.copytree if source.is_dir() else shutil.copy
             copy(source, self.world.home / source.name)
 
-    def in_scratch(self, code):
-        """The code with the places of an installed system replaced by those of the test."""
-        for place, here in (("/run/halvox/reporting.sock", self.world.service.socket),
-                            ("/usr/lib/x86_64-linux-gnu/halvox/halvox-sqlite.so", STORE_EXTENSION)):
-            code = code.replace(place, str(here))
-        return code
-
-    def check_output(self, asked, expected, printed):
-        """Compares what was printed. A question about the store is asked again: the service may need
-        half a second to store what it has answered."""
-        if asked is None:
-            self.assertTrue(documents.matches(expected.code, printed), f"printed:\n{printed}")
-        else:
-            wait_for(f"the expected answer, not\n{printed}", lambda: documents.matches(
-                expected.code, self.run_sh(self.in_scratch(asked), expected)))
-
-    def check_document(self, path):
-        printed = asked = missing = None
-        for block in documents.blocks(path):
-            with self.subTest(block.place):
-                self.assertNotEqual(block.language, "", "the block does not say its language")
-                # What a skipped block would have done may be in the output of any later one.
-                if missing and block.mark == "output":
-                    self.skipTest(missing)
-                if block.mark == "output":
-                    self.assertIsNotNone(printed, "no block before it was run")
-                    self.check_output(asked, block, printed)
-                if not block.is_run:
-                    continue
-                missing = self.missing_for(block.code) or missing
-                if self.missing_for(block.code):
-                    self.skipTest(missing)
-                asked = block.code if documents.is_question(block) else None
-                printed = self.run_block(block)
-
-    def run_block(self, block):
-        code = self.in_scratch(block.code)
-        if block.mark == "file":
-            (self.world.home / block.value).write_text(code)
-        return getattr(self, f"run_{block.language}")(code, block)
-
-    def missing_for(self, code):
-        """Why this machine or build cannot run the code, or None."""
-        for program in PROGRAMS:
-            if program in code and shutil.which(program) is None:
-                return f"{program} is not installed"
-        if "halvoxctl report" in code and subprocess.run(
-                [CTL, "report", "--help"], capture_output=True, check=False).returncode != 0:
-            return "this build has no reports"
-        if os.environ.get("HALVOX_SANITIZE") and any(word in code for word in BUILDING):
-            return "a sanitized library needs a sanitized program"
-        return None
-
-    def run_sh(self, code, block):
-        if block.mark == "file":
-            return self.world.run("bash", "-n", block.value)
-        return self.world.run("bash", "-euo", "pipefail", "-c", code)
-
-    def run_python(self, code, block):
-        if block.mark == "file":
-            compile(code, block.value, "exec")
-            return None
-        return self.world.run("/usr/bin/python3", "-", code=code)
-
-    def run_c(self, code, block):
-        """A file that later commands compile."""
-        self.assertEqual(block.mark, "file", "programs are files")
-
-    run_cpp = run_c
-
-    def run_sql(self, code, _):
-        """The query finds something in the records of the world."""
-        found = [json.loads(line) for line in self.world.run(CTL, "sql", "--json", code).splitlines()]
-        self.assertNotEqual(found, [], "the query finds nothing")
-        return self.world.run(CTL, "sql", code)
-
-    def run_json(self, code, _):
-        json.loads(code)
-
-    def run_xml(self, code, _):
-        ElementTree.fromstring(code)
-
-    def run_toml(self, code, _):
-        """A configuration that the programs accept."""
-        file = self.world.home / "block.toml"
-        file.write_text(code)
-        done = subprocess.run([CTL, "list"], capture_output=True, text=True, check=False, timeout=DEADLINE,
-                              env={**self.world.environment, "HALVOX_CONFIG": str(file)})
-        self.assertNotEqual(done.returncode, 78, done.stderr)
-
-    def run_cmake(self, code, _):
-        """Lines of a project that has the program `player`."""
-        project = self.world.home / "project"
-        project.mkdir()
-        shutil.copy(self.world.home / "player.c", project)
-        (project / "CMakeLists.txt").write_text(
-            f"cmake_minimum_required(VERSION 3.16)\nproject(player C)\nadd_executable(player player.c)\n"
-            f"{code}\ntarget_link_libraries(player PRIVATE m)\n")
-        run("cmake", "-S", project, "-B", project / "build", f"-DCMAKE_PREFIX_PATH={self.prefix}")
-        run("cmake", "--build", project / "build")
-
-    def run_text(self, code, block):
-        """No code."""
-
 
 def add_tests():
     for path in documents.documents():
         def test(self, path=path):
             self.check_document(path)
         name = str(path.relative_to(ROOT)).removesuffix(".md")
-        if documents.blocks(path):
+        # test_documents_tracing runs the guide that needs a tracer.
+        if documents.blocks(path) and name != "docs/guides/tracing":
             setattr(DocumentsTest, "test_" + "".join(c if c.isalnum() else "_" for c in name), test)
 
 
