@@ -100,6 +100,17 @@ class SystemFilesTest(Installation):
                      "include/halvox.h", "include/halvox_trace.h"):
             self.assertTrue((self.prefix / path).is_file(), path)
 
+    def test_the_journal_explains_a_damaged_database(self):
+        harness.require("journalctl")
+        run("journalctl", f"--root={self.directory}", "--update-catalog")
+        listed = run("journalctl", f"--root={self.directory}", "--list-catalog")
+        ours = [line for line in listed.splitlines() if " Halvox: " in line]
+        self.assertEqual(len(ours), 20, listed)
+
+        damaged, = [line.split()[0] for line in ours if line.endswith("The database is damaged")]
+        text = run("journalctl", f"--root={self.directory}", "--dump-catalog", damaged)
+        self.assertIn("No file\nwas deleted.", text)
+
     def test_systemd_accepts_the_units(self):
         harness.require("systemd-analyze")
         units = sorted((self.prefix / "lib/systemd").glob("*/halvox-*"))

@@ -11,6 +11,7 @@
 
 #include "platform/linux/log/LogLineFormatter.h"
 #include "platform/linux/log/LogSink.h"
+#include "platform/linux/log/MessageIds.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -45,17 +46,21 @@ class JournalLogSink final : public LogSink {
   bool send(const LogEntry& entry) {
     std::string message = "MESSAGE=";
     appendLogLineText(message, entry);
-    std::array<std::string, 4> fields{
+    const std::string_view id = messageId(entry.text);
+    // The last field is sent only for lines that the journal's catalog explains.
+    std::array<std::string, 5> fields{
         std::move(message),
         "PRIORITY=" + std::to_string(priority(entry.level)),
         "HALVOX_SUBSYSTEM=" + std::string(entry.subsystem),
         "HALVOX_CATEGORY=" + std::string(entry.category),
+        "MESSAGE_ID=" + std::string(id),
     };
+    const std::size_t count = id.empty() ? fields.size() - 1 : fields.size();
     std::array<iovec, fields.size()> vectors{};
     std::ranges::transform(fields, vectors.begin(), [](std::string& field) {
       return iovec{field.data(), field.size()};
     });
-    return sender_(vectors.data(), static_cast<int>(vectors.size())) >= 0;
+    return sender_(vectors.data(), static_cast<int>(count)) >= 0;
   }
 
   const JournalSender sender_;

@@ -223,6 +223,22 @@ TEST_F(QueuedLogServiceTest, JournalGetsFields) {
   EXPECT_EQ(count("delivered"), 1U);
 }
 
+TEST_F(QueuedLogServiceTest, JournalGetsTheIdentifierOfALineThatItsCatalogExplains) {
+  std::vector<std::string> fields;
+  make(makeJournalLogSink([&fields](const iovec* vectors, int size) {
+    fields.emplace_back(static_cast<const char*>(vectors[size - 1].iov_base),
+                        vectors[size - 1].iov_len);
+    return 0;
+  }));
+
+  category_->write(LogLevel::kError, "                 BusConnection:180   lost the bus: closed");
+  service_->stop();
+
+  ASSERT_EQ(fields.size(), 1U);
+  EXPECT_EQ(fields[0].substr(0, 11), "MESSAGE_ID=");
+  EXPECT_EQ(fields[0].size(), 11U + 32U);
+}
+
 TEST_F(QueuedLogServiceTest, LineThatTheJournalRefusesCountsAsDropped) {
   make(makeJournalLogSink([](const iovec*, int) { return -111; }));
 
