@@ -73,9 +73,10 @@ class World(Place):
             client.stop(session)
         client.close()
         self.service.wait_for_payload(lambda payload: "RQSessionVolumeBucketed" in payload)
-        wait_for("the driver report", lambda: any("IOReporting" in name for name, _ in self.service.events()))
-        wait_for("both clients' ends", lambda: any("clientuptime" in name
-                                                   for name, _ in self.service.all_events()))
+        wait_for("both driver reports", lambda: sum(
+            name == "com.tarno.halvox.IOReporting.Simple" for name, _ in self.service.events()) == 2)
+        wait_for("the client's end", lambda: any(
+            "clientuptime" in name for name, _ in self.service.all_events()))
 
 
 class DocumentsTest(DocumentRunner, Installation):
