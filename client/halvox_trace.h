@@ -1,12 +1,15 @@
 #ifndef HALVOX_TRACE_H
 #define HALVOX_TRACE_H
 
-/* Trace points for C and C++: marks with a code and four numbers. A trace of the Halvox reporting
+/** @file
+ * Trace points for C and C++: marks with a code and four numbers. A trace of the Halvox reporting
  * service records them and matches them to intervals.
  *
+ * @code{.c}
  *   halvox_trace(0x21040010, stream, 0, 0, 0);
  *   start_the_device();
  *   halvox_trace(0x21040014, stream, 0, 0, 0);
+ * @endcode
  *
  * The service records the codes from 0x21040000 to 0x2104408A. While no trace runs, a trace point
  * only tests one number. While one runs, a trace point writes its numbers, the time, the thread and
@@ -23,13 +26,13 @@
 extern "C" {
 #endif
 
-/* Points to a number that is not 0 while a trace records these events. Only for halvox_trace(). */
+/** Points to a number that is not 0 while a trace records these events. Only for halvox_trace(). */
 extern const int* const halvox_trace_state;
-/* Emits a trace point without testing whether a trace runs. Only for halvox_trace(). */
+/** Emits a trace point without testing whether a trace runs. Only for halvox_trace(). */
 void halvox_trace_emit(uint32_t code, uint64_t argument1, uint64_t argument2, uint64_t argument3,
                        uint64_t argument4);
 
-/* Emits one trace point if a trace runs. The program chooses the meaning of the arguments. */
+/** Emits one trace point if a trace runs. The program chooses the meaning of the arguments. */
 static inline void halvox_trace(uint32_t code, uint64_t argument1, uint64_t argument2,
                                 uint64_t argument3, uint64_t argument4) {
   /* Another thread may write the number at any time. One event more or less does not matter at that
