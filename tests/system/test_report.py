@@ -3,6 +3,7 @@
 import contextlib
 import json
 import os
+import re
 import signal
 import subprocess
 import tempfile
@@ -17,6 +18,7 @@ from player import begin_stream
 XRUNS = """SELECT count(*) AS n, coalesce(sum(payload ->> 'missed_cycles'), 0) AS cycles
     FROM analytics_events WHERE name GLOB 'com.tarno.halvox.*.IssueDetector'
     AND payload ->> 'issue_type' = 'xrun'"""
+REPOSITORY = Path(__file__).resolve().parents[2]
 VOLUME, PLAYBACK = 14, 0x08000004
 STOP, ISSUE, STATE = 2, 7, 18
 # A name may contain anything that is UTF-8.
@@ -168,6 +170,15 @@ class ReportTest(ReportTestCase):
         self.assertTrue(any("issue_type=xrun" in row and "xrun_milliseconds=500" in row for row in rows))
         self.assertTrue(any("RQSessionVolume=0.8" in row for row in rows))
         self.assertEqual(len(self.texts(".timeline a.chosen")), 1)
+
+    def test_the_copyright_of_the_packages_names_its_libraries(self):
+        listed = (REPOSITORY / "debian" / "copyright").read_text(encoding="utf-8")
+        names = set(re.split(r"[\s,]+", listed.replace(". ", " ")))
+        notices = re.findall(r"^(\S+ \d+\.\d+\.\d+(?:, \S+ \d+\.\d+\.\d+)*):$",
+                             self.path.read_text(encoding="utf-8"), re.MULTILINE)
+        libraries = [one.split()[0] for notice in notices for one in notice.split(", ")]
+        self.assertIn("d3-scale", libraries)
+        self.assertEqual([one for one in libraries if one not in names], [])
 
     def test_hostile_names_are_text(self):
         data = self.show(self.path)
