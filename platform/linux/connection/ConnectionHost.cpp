@@ -151,9 +151,10 @@ void ConnectionHost::resume() {
   inbox_->attachToThisThread();
   for (const auto& bus : buses_) bus->start();
   kLog.info("serving ", listeners_.size(), " sockets and ", buses_.size(), " buses");
-  static_cast<void>(sd_notify(0, "READY=1"));
+  static_cast<void>(sd_notifyf(0, "READY=1\nSTATUS=Serving %zu sockets and %zu buses",
+                               listeners_.size(), buses_.size()));
   while (!stopping_) takeTurn();
-  static_cast<void>(sd_notify(0, "STOPPING=1"));
+  static_cast<void>(sd_notify(0, "STOPPING=1\nSTATUS=Completing the requests that were read"));
   shutDown();
 }
 

@@ -126,7 +126,7 @@ TEST_F(ProcessTest, ManagerIsNotifiedWhenItServes) {
 
   std::array<char, 256> text{};
   ASSERT_GT(recv(notify.get(), text.data(), text.size() - 1, 0), 0);
-  EXPECT_STREQ(text.data(), "READY=1");
+  EXPECT_STREQ(text.data(), "READY=1\nSTATUS=Serving 1 sockets and 0 buses");
   EXPECT_NO_THROW(RawClient{socketPath()});
 }
 
