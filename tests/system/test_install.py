@@ -91,6 +91,7 @@ class SystemFilesTest(Installation):
 
     def test_each_file_is_where_its_reader_looks_for_it(self):
         for path in ("lib/systemd/system/halvox-reportingd.service", "lib/systemd/system/halvox-reportingd.socket",
+                     "lib/systemd/user/halvox-reportingd.service", "lib/systemd/user/halvox-reportingd.socket",
                      "lib/sysusers.d/halvox.conf", "lib/tmpfiles.d/halvox.conf",
                      "share/dbus-1/system.d/com.tarno.halvox.reporting.conf",
                      "share/dbus-1/system-services/com.tarno.halvox.reporting.service",
@@ -116,7 +117,10 @@ class SystemFilesTest(Installation):
         units = sorted((self.prefix / "lib/systemd").glob("*/halvox-*"))
         self.assertGreaterEqual(len(units), 2)
         for unit in units:
-            self.assertEqual(run("systemd-analyze", "verify", "--man=no", "--recursive-errors=no", unit), "")
+            manager = f"--{unit.parent.name}"
+            self.assertEqual(
+                run("systemd-analyze", manager, "verify", "--man=no", "--recursive-errors=no", unit,
+                    env={**os.environ, "XDG_RUNTIME_DIR": str(self.directory)}), "")
 
 
 class InterfaceFileTest(Installation):
