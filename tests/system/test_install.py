@@ -98,6 +98,8 @@ class SystemFilesTest(Installation):
                      f"share/dbus-1/interfaces/{INTERFACE}.xml",
                      "share/dbus-1/interfaces/com.tarno.halvox.Statistics.xml",
                      "share/bash-completion/completions/halvoxctl", "share/man/man1/halvoxctl.1",
+                     "share/doc/halvox/examples/systemd/link-nats.conf",
+                     "share/doc/halvox/examples/systemd/pipewire.conf",
                      "include/halvox.h", "include/halvox_trace.h"):
             self.assertTrue((self.prefix / path).is_file(), path)
 
