@@ -153,7 +153,7 @@ class HVReportingClientServerInstance final
   // for all other clients, but its summary file is still being written. This client's requests wait
   // until the file is complete and `finished` has run, on the reporting queue.
   [[nodiscard]] bool stop(const Session& session, platform::Job finished);
-  void writeFile();
+  void writeFile(const std::shared_ptr<SessionStop>& rest);
   void finishStop();
   [[nodiscard]] bool isStopping() const { return stop_.has_value(); }
   // Stops these sessions, one after the other, from the position `next` on. Returns true if all

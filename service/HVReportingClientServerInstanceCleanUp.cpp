@@ -9,6 +9,7 @@
 #include "service/HVReportingClientServerInstance.h"
 #include "service/ReportingQueue.h"
 #include "service/ServiceLog.h"
+#include "session/SessionLog.h"
 
 // How sessions enter and leave a client, how a stop waits for its summary file, and how a client
 // leaves the service.
@@ -30,7 +31,11 @@ void writeParts(const std::shared_ptr<platform::DispatchQueue>& queue,
       // The queue logs the exception. The client's requests must not wait for ever.
       failure = std::current_exception();
     }
-    if (!isComplete) return writeParts(queue, rest, then);
+    try {
+      if (!isComplete) return writeParts(queue, rest, then);
+    } catch (...) {  // no memory for the job
+      failure = std::current_exception();
+    }
     reportingQueue()->async(platform::JobWeight::kMayBlock, then);
     if (failure) std::rethrow_exception(failure);
   });
@@ -46,18 +51,25 @@ void writeParts(const std::shared_ptr<platform::DispatchQueue>& queue,
 bool HVReportingClientServerInstance::stop(const Session& session, platform::Job finished) {
   const std::shared_ptr<SessionStop> rest = session->beginStop();
   if (rest == nullptr) return true;
+  try {
+    writeFile(rest);
+  } catch (const std::exception& error) {  // no memory for the queue or its job
+    kServiceLog.error("cannot write the summary file of reporter ", number(session->reporterID()),
+                      ": ", error.what());
+    rest->finish();
+    return true;
+  }
   stop_ = OpenStop{.rest = rest, .finished = std::move(finished)};
-  writeFile();
   return false;
 }
 
 // The queue has the quality of requests, because a request waits for it. Each file has a queue of
 // its own: the pool has two threads, and the files of several clients take turns.
-void HVReportingClientServerInstance::writeFile() {
+void HVReportingClientServerInstance::writeFile(const std::shared_ptr<SessionStop>& rest) {
   const auto queue = platform::dispatch().createSerialQueue(
       kFileQueueLabel, platform::QualityOfService::kUserInteractive,
       platform::QueueThreading::kShared);
-  writeParts(queue, stop_->rest, [client = shared_from_this()] { client->finishStop(); });
+  writeParts(queue, rest, [client = shared_from_this()] { client->finishStop(); });
 }
 
 void HVReportingClientServerInstance::finishStop() {

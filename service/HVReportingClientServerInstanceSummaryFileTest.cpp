@@ -294,6 +294,17 @@ TEST_F(HVReportingClientServerInstanceSummaryFileTest, AFileThatFailsDoesNotHold
   EXPECT_EQ(clientOf(client_)->resourceUse().bytes, 0U);
 }
 
+TEST_F(HVReportingClientServerInstanceSummaryFileTest, AFileThatCannotBeBegunDoesNotHoldTheClient) {
+  platform_.dispatch.failQueues("com.tarno.halvox.reporting.summaryfile");
+
+  EXPECT_EQ(call(client_, "stopReportingSessionForID", {7})->value(), Value(true));
+  EXPECT_TRUE(
+      platform_.log.containsText("cannot write the summary file of reporter 7: std::bad_alloc"));
+  EXPECT_TRUE(platform_.log.containsText("sending summary event for reporter 7"));
+  EXPECT_TRUE(held_[0]->isAnswered());
+  EXPECT_TRUE(call(client_, "getAllReporters", {})->isAnswered());
+}
+
 TEST_F(HVReportingClientServerInstanceSummaryFileTest, TheHistoryIsChargedUntilItIsReported) {
   beginStop(7);
 

@@ -1,6 +1,7 @@
 #include "platform/fake/FakeDispatchService.h"
 
 #include <algorithm>
+#include <new>
 #include <stdexcept>
 #include <utility>
 
@@ -229,10 +230,16 @@ std::vector<JobWeight> FakeDispatchService::weights(std::string_view label) cons
   return result;
 }
 
+void FakeDispatchService::failQueues(std::string label) {
+  const std::lock_guard lock(mutex_);
+  failingLabel_ = std::move(label);
+}
+
 std::shared_ptr<DispatchQueue> FakeDispatchService::createSerialQueue(std::string_view label,
                                                                       QualityOfService quality,
                                                                       QueueThreading threading) {
   const std::lock_guard lock(mutex_);
+  if (label == failingLabel_) throw std::bad_alloc();
   created_.push_back({std::string(label), quality, threading});
   return std::make_shared<FakeDispatchQueue>(*this, created_.back());
 }

@@ -107,6 +107,10 @@ class FakeDispatchService final : public DispatchService {
   // queue, as the interface allows, and every job waits until the test runs it.
   void letThreadsEnter() { letsThreadsEnter_ = true; }
 
+  // From now on there is no memory for queues with that label: createSerialQueue() throws
+  // std::bad_alloc.
+  void failQueues(std::string label);
+
   [[nodiscard]] std::size_t waitingJobs() const;
   [[nodiscard]] std::size_t delayedJobs() const;
   [[nodiscard]] std::size_t waitingQueues() const;
@@ -164,6 +168,7 @@ class FakeDispatchService final : public DispatchService {
   std::multimap<std::chrono::nanoseconds, Job> delayed_;  // by time; equal times keep their order
   std::function<void()> signalHandler_;
   std::vector<FakeDispatchQueue::Traits> created_;
+  std::optional<std::string> failingLabel_;
   std::multimap<std::string, JobWeight, std::less<>> weights_;
 };
 
