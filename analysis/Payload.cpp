@@ -4,6 +4,8 @@
 #include <cmath>
 
 #include <rapidjson/document.h>
+#include <rapidjson/memorystream.h>
+#include <rapidjson/reader.h>
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
@@ -34,6 +36,60 @@ bool mayBeDeep(std::string_view json) {
   }
   return false;
 }
+
+// Gives each member of an object as JSON, from the events of a parser. Writing a parsed value
+// instead would recurse as deeply as the value is nested.
+class MemberWriter {
+ public:
+  using Callback = std::function<void(std::string_view, std::string_view)>;
+  using Length = rapidjson::SizeType;
+
+  explicit MemberWriter(const Callback& callback) : callback_(callback) {}
+
+  bool Null() { return writer_.Null() && ended(); }
+  bool Bool(bool value) { return writer_.Bool(value) && ended(); }
+  bool Int(int value) { return writer_.Int(value) && ended(); }
+  bool Uint(unsigned value) { return writer_.Uint(value) && ended(); }
+  bool Int64(std::int64_t value) { return writer_.Int64(value) && ended(); }
+  bool Uint64(std::uint64_t value) { return writer_.Uint64(value) && ended(); }
+  bool Double(double value) { return writer_.Double(value) && ended(); }
+  bool RawNumber(const char* text, Length length, bool /*copy*/) {
+    return writer_.RawNumber(text, length) && ended();
+  }
+  bool String(const char* text, Length length, bool /*copy*/) {
+    return writer_.String(text, length) && ended();
+  }
+  bool StartObject() { return depth_++ == 0 || writer_.StartObject(); }
+  bool StartArray() {
+    ++depth_;
+    return writer_.StartArray();
+  }
+  bool EndObject(Length /*members*/) { return --depth_ == 0 || (writer_.EndObject() && ended()); }
+  bool EndArray(Length /*elements*/) {
+    --depth_;
+    return writer_.EndArray() && ended();
+  }
+  bool Key(const char* text, Length length, bool /*copy*/) {
+    if (depth_ > 1) return writer_.Key(text, length);
+    key_.assign(text, length);
+    buffer_.Clear();
+    writer_.Reset(buffer_);
+    return true;
+  }
+
+ private:
+  // After each value. One inside the object itself is a member.
+  bool ended() {
+    if (depth_ == 1) callback_(key_, {buffer_.GetString(), buffer_.GetSize()});
+    return true;
+  }
+
+  const Callback& callback_;
+  std::string key_;
+  rapidjson::StringBuffer buffer_;
+  rapidjson::Writer<rapidjson::StringBuffer> writer_{buffer_};
+  std::size_t depth_ = 0;
+};
 
 }  // namespace
 
@@ -116,14 +172,10 @@ void Payload::forEachMember(
     const std::function<void(std::string_view, std::string_view)>& callback) const {
   const auto& document = parsed().document;
   if (!document || !document->IsObject()) return;
-  rapidjson::StringBuffer buffer;
-  for (const auto& member : document->GetObject()) {
-    buffer.Clear();
-    rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
-    member.value.Accept(writer);
-    callback({member.name.GetString(), member.name.GetStringLength()},
-             {buffer.GetString(), buffer.GetSize()});
-  }
+  rapidjson::Reader reader;
+  rapidjson::MemoryStream stream(json_.data(), json_.size());
+  MemberWriter writer(callback);
+  reader.Parse<rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag>(stream, writer);
 }
 
 }  // namespace halvox::analysis

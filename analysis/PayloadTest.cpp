@@ -61,6 +61,19 @@ TEST(PayloadTest, DeepNestingDoesNotOverflowTheStack) {
   EXPECT_EQ(payload.integer("b"), 2);
 }
 
+TEST(PayloadTest, DeepMembersDoNotOverflowTheStack) {
+  constexpr std::size_t kDepth = 1'000'000;
+  const std::string nested = std::string(kDepth, '[') + std::string(kDepth, ']');
+  const std::string json = R"({"a":)" + nested + R"(,"b":2})";
+  Payload payload;
+  payload.show(json);
+  std::vector<std::string> members;
+  payload.forEachMember([&](std::string_view key, std::string_view value) {
+    members.push_back(std::string(key) + "=" + std::string(value));
+  });
+  EXPECT_TRUE(members == (std::vector<std::string>{"a=" + nested, "b=2"}));
+}
+
 TEST(PayloadTest, BracketsInTextsAreNoNesting) {
   const std::string text(1000, '{');
   const std::string json = R"({"a":")" + text + R"(","b":2})";
