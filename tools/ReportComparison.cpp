@@ -141,8 +141,9 @@ void printJson(const Side& before, const Side& after, const std::vector<Change>&
 
 std::variant<Side, ExitStatus> readSide(const CompareReports& request, const ComparedPeriod& period,
                                         const Complaint& complain) {
-  const auto directory =
-      storeDirectory(period.database.empty() ? request.database : period.database, complain);
+  const auto directory = period.database.empty()
+                             ? storeDirectory(request.database, complain)
+                             : storeDirectory(period.database, complain, "--compare");
   if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
   const auto& path = std::get<std::filesystem::path>(directory);
   const bool hasTimes = period.since || period.until;

@@ -150,5 +150,11 @@ TEST_F(ReportComparisonTest, AMissingStoreIsNamed) {
   EXPECT_THAT(errors(), HasSubstr("/nonexistent/halvox.db"));
 }
 
+TEST_F(ReportComparisonTest, APathThatIsNoStoreIsBlamedOnItsOption) {
+  EXPECT_EQ(run("/nonexistent", "@100.."), ExitStatus::kBadArguments);
+
+  EXPECT_THAT(errors(), HasSubstr("--compare: /nonexistent is not a store"));
+}
+
 }  // namespace
 }  // namespace halvox::tools

@@ -180,7 +180,8 @@ ExitStatus printOnce(const StoreRun& run, const std::filesystem::path& directory
 }  // namespace
 
 std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string& database,
-                                                               const Complaint& complain) {
+                                                               const Complaint& complain,
+                                                               std::string_view option) {
   if (database.empty()) return findStore(complain);
   const std::filesystem::path path(database);
   std::error_code ignored;
@@ -190,7 +191,7 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string
     return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
   }
   return complain(ExitStatus::kBadArguments,
-                  "--database: " + database + " is not a store; expected a " +
+                  std::string(option) + ": " + database + " is not a store; expected a " +
                       std::string(kStoreFileName) + " or the directory that has one");
 }
 

@@ -6,6 +6,7 @@
 #include <optional>
 #include <ostream>
 #include <string>
+#include <string_view>
 #include <variant>
 #include <vector>
 
@@ -78,10 +79,10 @@ class StoreReading {
 // Converts a selection to the filter of the store's reader.
 platform::linux_::RecordFilter filterOf(const RecordSelection& selection);
 
-// Returns the directory of the store that --database named, or else the one that this user's
-// programs find. Reports that there is none.
-std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string& database,
-                                                               const Complaint& complain);
+// Returns the directory of the store that an option named, or else the one that this user's
+// programs find. Reports that there is none; `option` is the one to blame.
+std::variant<std::filesystem::path, ExitStatus> storeDirectory(
+    const std::string& database, const Complaint& complain, std::string_view option = "--database");
 
 // Opens the selected store and prints its records once or, with --follow, until the output is
 // closed or the directory of the store is deleted. At a terminal, prints into a pager unless it
