@@ -33,6 +33,7 @@ constexpr CommandGroup kGroups[] = {
     {"Requests to the service", addRequestCommands, GroupPlace::kAnywhere},
     {"Waiting", addScriptRequests, GroupPlace::kScriptLines},
     {"Requests that belong together", addScriptCommands, GroupPlace::kArguments},
+    {"What happens now", addStatusCommand, GroupPlace::kArguments},
     {"What happens now", addTopCommand, GroupPlace::kArguments},
     {"What the service stored", addStreamCommands, GroupPlace::kArguments},
     {"What the service stored", addRecordCommands, GroupPlace::kArguments},

@@ -15,6 +15,7 @@ void addFieldCommand(CommandSet& commands);      // fields
 void addQueryCommands(CommandSet& commands);     // sql
 void addExportCommand(CommandSet& commands);     // export
 void addTopCommand(CommandSet& commands);        // top
+void addStatusCommand(CommandSet& commands);     // status
 void addStreamCommands(CommandSet& commands);    // streams
 void addReportCommand(CommandSet& commands);     // report
 void addSnapshotCommands(CommandSet& commands);  // snapshots

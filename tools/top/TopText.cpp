@@ -34,25 +34,6 @@ std::string countText(const std::optional<Number>& number) {
   return number ? std::to_string(*number) : kUnknown;
 }
 
-// Two digits are enough below 10; a person does not read more from a rate that changes.
-std::string rateText(const std::optional<double>& perSecond) {
-  if (!perSecond) return kUnknown;
-  return formatted(*perSecond < 10 ? "%.1f/s" : "%.0f/s", *perSecond);
-}
-
-std::string bytesText(const std::optional<std::uint64_t>& bytes) {
-  if (!bytes) return kUnknown;
-  static constexpr std::array kUnits{"B", "KiB", "MiB", "GiB", "TiB"};
-  constexpr double kStep = 1024;
-  auto amount = static_cast<double>(*bytes);
-  std::size_t unit = 0;
-  while (amount >= kStep && unit + 1 < kUnits.size()) {
-    amount /= kStep;
-    ++unit;
-  }
-  return formatted(unit == 0 ? "%.0f %s" : "%.1f %s", amount, kUnits[unit]);
-}
-
 std::string volumeText(const std::optional<double>& volume) {
   if (!volume) return kUnknown;
   return *volume == 0 ? std::string("muted") : formatted("%.2f", *volume);
@@ -129,6 +110,25 @@ std::string listJson(const std::vector<Element>& elements,
 }
 
 }  // namespace
+
+// Two digits are enough below 10; a person does not read more from a rate that changes.
+std::string rateText(const std::optional<double>& perSecond) {
+  if (!perSecond) return kUnknown;
+  return formatted(*perSecond < 10 ? "%.1f/s" : "%.0f/s", *perSecond);
+}
+
+std::string bytesText(const std::optional<std::uint64_t>& bytes) {
+  if (!bytes) return kUnknown;
+  static constexpr std::array kUnits{"B", "KiB", "MiB", "GiB", "TiB"};
+  constexpr double kStep = 1024;
+  auto amount = static_cast<double>(*bytes);
+  std::size_t unit = 0;
+  while (amount >= kStep && unit + 1 < kUnits.size()) {
+    amount /= kStep;
+    ++unit;
+  }
+  return formatted(unit == 0 ? "%.0f %s" : "%.1f %s", amount, kUnits[unit]);
+}
 
 std::vector<std::string> serviceTexts(const TopSnapshot& snapshot) {
   const TopService& service = snapshot.service;

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -9,6 +11,11 @@
 // A snapshot as texts for people. All texts are free of characters that could control a terminal.
 // Pure functions: any thread may call.
 namespace halvox::tools {
+
+// "4.2/s", "120/s"; "-" if it is not known.
+[[nodiscard]] std::string rateText(const std::optional<double>& perSecond);
+// "12 B", "3.4 MiB"; "-" if it is not known.
+[[nodiscard]] std::string bytesText(const std::optional<std::uint64_t>& bytes);
 
 // The figures of the service, one text each: "clients 4".
 [[nodiscard]] std::vector<std::string> serviceTexts(const TopSnapshot& snapshot);

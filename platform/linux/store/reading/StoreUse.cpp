@@ -66,7 +66,9 @@ StoreServer storeServer(const std::filesystem::path& directory) {
   const std::string locks{std::istreambuf_iterator<char>(file), {}};
   const std::optional<pid_t> holder = lockHolder(locks, status.st_ino);
   if (!holder) return {.use = StoreUse::kNotServed};
-  return {.use = StoreUse::kServed, .start = startOf(*holder)};
+  return {.use = StoreUse::kServed,
+          .start = startOf(*holder),
+          .process = *holder > 0 ? holder : std::nullopt};
 }
 
 }  // namespace halvox::platform::linux_

@@ -21,6 +21,8 @@ struct StoreServer {
   // When its process started, in seconds by CLOCK_BOOTTIME. Empty unless the store is served, and
   // if the process is hidden from this one.
   std::optional<double> start{};
+  // The process. Empty unless the store is served, and if the kernel does not say which one it is.
+  std::optional<pid_t> process{};
 };
 
 // Returns which service has the store in `directory` open. Reads the kernel's list of locks and
