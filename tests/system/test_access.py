@@ -12,7 +12,7 @@ from pathlib import Path
 from gi.repository import GLib
 
 import harness
-from harness import BUS_NAME, CTL, NOBODY, SERVICE, Client, Service, as_user, private_bus, setpriv_to
+from harness import CTL, NOBODY, SERVICE, Client, Service, as_user, private_bus, setpriv_to
 
 ACCESS_DENIED = "org.freedesktop.DBus.Error.AccessDenied"
 EX_UNAVAILABLE, EX_NOPERM, EX_CONFIG = 69, 77, 78

@@ -1,11 +1,9 @@
 """Bad input gets a clear error or a closed connection, and no other client notices."""
 
 import os
-import resource
 import shutil
 import socket
 import struct
-import subprocess
 import unittest
 
 from gi.repository import Gio, GLib

@@ -1,13 +1,12 @@
 """The back-end of the real-time link with real NATS servers, read back by a plain subscriber."""
 
-import os
 import subprocess
 import tempfile
 import time
 import unittest
 from pathlib import Path
 
-from harness import BIN, DEADLINE, SERVICE, WITH_US, Service, require, wait_for
+from harness import SERVICE, Service, require, wait_for
 from nats import (DRIVER, LONG_DEADLINE, TLS_GREETING, Driver, Operator, Server, SilentServer, cluster, free_ports,
                   numbers_of, read_stream)
 

@@ -9,7 +9,6 @@ import threading
 import time
 import unittest
 
-import harness
 from harness import Client, Service, wait_for
 from test_hostile import AUTHENTICATION, dictionary_body, frame, receive_frame
 
