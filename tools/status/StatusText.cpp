@@ -29,7 +29,8 @@ class Lines {
     std::string line = padded(label);
     bool isBegun = false;
     for (const std::string& part : parts) {
-      if (isBegun && !fits(line + ", " + part + ",")) {
+      // With the commas before and after the part.
+      if (isBegun && !fits(displayWidth(line) + displayWidth(part) + 3)) {
         append(line + ",");
         line = padded("");
         isBegun = false;
@@ -47,7 +48,7 @@ class Lines {
       const std::size_t end = std::min(text.find(' '), text.size());
       const std::string word(text.substr(0, end));
       text.remove_prefix(std::min(end + 1, text.size()));
-      if (isBegun && !fits(line + " " + word)) {
+      if (isBegun && !fits(displayWidth(line) + 1 + displayWidth(word))) {
         append(line);
         line = padded("");
         isBegun = false;
@@ -72,9 +73,7 @@ class Lines {
     line.resize(std::max(line.size() + 1, kLabelWidth), ' ');
     return line;
   }
-  [[nodiscard]] bool fits(const std::string& line) const {
-    return !width_ || displayWidth(line) <= *width_;
-  }
+  [[nodiscard]] bool fits(std::size_t width) const { return !width_ || width <= *width_; }
   void append(const std::string& line) { text_ += (width_ ? cutTo(line, *width_) : line) + "\n"; }
 
   std::optional<std::size_t> width_;
