@@ -36,6 +36,8 @@ NO_NAMES = DECLARES | set(
     operator private protected public requires short signed sizeof static static_assert template
     unsigned void volatile wchar_t""".split()
 )
+# What stands before a name that is declared elsewhere, such as a base class.
+NOT_BEFORE_NAME = {"::", ".", "public", "protected", "private"}
 # A name before one of these may be the name that is declared.
 AFTER_NAME = set("(={;[:")
 
@@ -80,7 +82,7 @@ def own_names(tokens):
         if before in ("using", "namespace"):
             if following == "=":
                 names.add(token)
-        elif (static or any(anonymous)) and before not in ("::", "."):
+        elif (static or any(anonymous)) and before not in NOT_BEFORE_NAME:
             if before in DECLARES or following in AFTER_NAME:
                 names.add(token)
     return names - NO_NAMES - TESTS

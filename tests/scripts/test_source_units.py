@@ -50,6 +50,11 @@ class Units(unittest.TestCase):
         texts = ("namespace { TEST_F(Fixture, A) {} TEST(Suite, A) {} }", "namespace { TEST_F(Fixture, B) {} TEST(Suite, B) {} }")
         self.assertEqual(len(self.units(*texts)), 1)
 
+    def test_fixtures_of_one_base_share_a_unit(self):
+        texts = ("namespace { class A : public Fixture { void a(); }; TEST_F(A, One) {} }",
+                 "namespace { struct B final : public Fixture {}; TEST_F(B, One) {} }", "class Fixture;")
+        self.assertEqual(len(self.units(*texts)), 1)
+
     def test_a_name_of_one_source_is_no_variable_in_a_header_of_another(self):
         own = "namespace { constexpr int kOne = 1; }"
         for header in ("inline constexpr int kOne = 2;", "namespace x { inline constexpr int kOne{2}; }"):
