@@ -50,7 +50,7 @@ TEST(StatusTextTest, ItShowsFiguresLossesCostsAndWhatIsOff) {
 }
 
 TEST(StatusTextTest, NoLineIsWiderThanTheTerminal) {
-  for (const std::size_t width : {80, 40, 20}) {
+  for (const std::size_t width : {80UL, 40UL, 20UL}) {
     std::istringstream lines(statusText(running(), width));
     for (std::string line; std::getline(lines, line);) {
       EXPECT_LE(displayWidth(line), width) << line;
