@@ -1,5 +1,6 @@
 """Work that nobody waits for has a lower scheduling priority than requests."""
 
+import contextlib
 import unittest
 from pathlib import Path
 
@@ -12,8 +13,10 @@ def priorities(service):
     """Name and niceness of each thread of the service."""
     found = []
     for task in Path(f"/proc/{service.process.pid}/task").iterdir():
-        name = (task / "comm").read_text().strip()
-        found.append((name, int((task / "stat").read_text().rsplit(")", 1)[1].split()[16])))
+        # A thread may end meanwhile, such as "link callbacks".
+        with contextlib.suppress(FileNotFoundError, ProcessLookupError):
+            name = (task / "comm").read_text().strip()
+            found.append((name, int((task / "stat").read_text().rsplit(")", 1)[1].split()[16])))
     return found
 
 
