@@ -79,7 +79,6 @@ context.objects = [
         priority.driver = 10000
         priority.session = 1000
         monitor.channel-volumes = true
-        adapter.auto-port-config = { mode = dsp monitor = true position = preserve }
       }
     }
 ]
@@ -99,21 +98,11 @@ halvox_audio_enter() {
 
 halvox_audio_socket_exists() { [ -S "$1" ]; }
 
-# Writes 10 ms of silence: a mono WAV file with 16-bit samples.
-halvox_audio_write_silence() {
-  printf 'RIFF\xe4\x03\0\0WAVEfmt \x10\0\0\0\x01\0\x01\0\x80\xbb\0\0\0\x77\x01\0\x02\0\x10\0'
-  printf 'data\xc0\x03\0\0'
-  head -c 960 /dev/zero
-}
-
-# Whether WirePlumber links a stream to the sink. It names the default sink a moment before it can
-# link to it, and refuses a stream that comes in between, so that only a stream can tell.
-halvox_audio_plays() {
-  timeout 5 pw-play --latency 10ms --media-role Test \
-    --properties '{ state.restore-props = false }' "$1/silence.wav"
-}
-
-halvox_audio_has_no_stream() { ! pw-dump | grep -q '"Stream/Output/Audio"'; }
+# Whether WirePlumber links streams to the sink. A sink becomes the default when it has ports, and
+# this one gets them from WirePlumber, after the scripts that link streams have been loaded. With
+# adapter.auto-port-config it would have ports from the start, would be the default too early, and a
+# stream that came then would be refused with "no node available".
+halvox_audio_has_default_sink() { pw-dump | grep -q '"default.audio.sink"'; }
 
 halvox_audio_start_servers() {
   local directory=$1
@@ -123,10 +112,8 @@ halvox_audio_start_servers() {
     halvox_audio_socket_exists "$XDG_RUNTIME_DIR/pipewire-0"
   halvox_start wireplumber "$directory/wireplumber.log" wireplumber
   HALVOX_WIREPLUMBER_PID=$HALVOX_PID
-  halvox_wait_for_start "$HALVOX_PID" "WirePlumber to link a stream to the sink" 20 \
-    halvox_audio_plays "$directory"
-  # A reporter that starts next must not see the stream that was played here.
-  halvox_wait_for_start "$HALVOX_PID" "the end of that stream" 10 halvox_audio_has_no_stream
+  halvox_wait_for_start "$HALVOX_PID" "WirePlumber to find the sink" 20 \
+    halvox_audio_has_default_sink
 }
 
 halvox_audio_stop_servers() {
@@ -139,7 +126,6 @@ halvox_audio_start() {
   local directory=$1
   halvox_audio_check || return 1
   halvox_audio_write_configuration "$directory"
-  halvox_audio_write_silence >"$directory/silence.wav"
   halvox_audio_enter "$directory"
   halvox_start dbus-daemon "$directory/dbus.log" dbus-daemon --session --nofork --nopidfile \
     "--address=$DBUS_SESSION_BUS_ADDRESS"
