@@ -112,7 +112,7 @@ class Tail:
 class TailTest(WithMessages):
     # So small that records are removed while the messages come.
     config = "retention_days = 30\nmax_megabytes = 4\n"
-    MESSAGES = 5000
+    MESSAGES = 2000
 
     def test_following_since_any_time_repeats_and_misses_nothing(self):
         self.send(range(500), text="x" * 100)
@@ -126,13 +126,13 @@ class TailTest(WithMessages):
                     follower.may_be_sent(number) for _, _, follower in list(followers)))
                 times.append(time.time())
                 # Random texts fill the store: they cannot be compressed much.
-                self.client.send({"number": number, "text": os.urandom(1200).hex()}, reporters=[7])
+                self.client.send({"number": number, "text": os.urandom(3600).hex()}, reporters=[7])
         sender = threading.Thread(target=send_all)
         sender.start()
         # Some follow from the beginning of the load, some from a time shortly before or after they
         # start. Each runs while rows of few messages are joined and old ones are removed.
         for step in range(6):
-            wait_for("more messages", lambda: len(times) >= 700 + step * 500)
+            wait_for("more messages", lambda: len(times) >= 800 + step * 200)
             since = (times[500], times[-200], time.time() + 0.2)[(0, 1, 0, 2, 0, 1)[step]]
             for command in ("events", "link"):
                 followers.append((command, since, Tail(self, command, since)))
