@@ -22,7 +22,7 @@ class HVReportingClientServerInstanceSummaryFileTest : public ServiceFixture {
   HVReportingClientServerInstanceSummaryFileTest() { startLong(7, AudioServiceType::kHaptics); }
   ~HVReportingClientServerInstanceSummaryFileTest() override { platform_.dispatch.clear(); }
 
-  // Starts a session and records so many messages that its file has several parts.
+  // Starts a session and records so many messages that its file has more than one part.
   void startLong(std::int64_t id, AudioServiceType type) {
     create(client_, id);
     setServiceType(client_, type, id);
@@ -59,7 +59,7 @@ class HVReportingClientServerInstanceSummaryFileTest : public ServiceFixture {
     return found - all.begin();
   }
 
-  static constexpr int kMessages = 25'000;
+  static constexpr int kMessages = 12'000;
   Connection client_ = connect(100, "player");
   Connection other_ = connect(101, "other");
   std::vector<Call> held_;  // the replies to the starts
