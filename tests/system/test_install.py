@@ -136,7 +136,8 @@ class InterfaceFileTest(Installation):
     def methods(self, document, interface):
         interface, = [found for found in ElementTree.fromstring(document).iter("interface")
                       if found.get("name") == interface]
-        return [(method.get("name"), [(argument.get("type"), argument.get("direction")) for argument in method])
+        return [(method.get("name"),
+                 [(argument.get("type"), argument.get("direction")) for argument in method.iter("arg")])
                 for method in interface.iter("method")]
 
     def test_the_methods_are_those_that_the_service_shows(self):
@@ -158,15 +159,40 @@ class InterfaceFileTest(Installation):
                 comment = re.search(rf"<!-- {method.get('name')}:(.*?)-->", text, re.DOTALL)
                 self.assertIsNotNone(comment, method.get("name"))
                 described = re.findall(r"@(\w+):", comment[1])
-                self.assertEqual(described, [argument.get("name") for argument in method])
+                self.assertEqual(described, [argument.get("name") for argument in method.iter("arg")])
 
-    def test_a_generator_makes_code_from_it(self):
+    def test_a_generator_makes_code_and_pages_from_them(self):
         harness.require("gdbus-codegen")
-        run("gdbus-codegen", "--interface-prefix", "com.tarno.halvox.", "--generate-c-code", "generated",
-            "--c-namespace", "Halvox", self.file(), cwd=self.directory)
+        for interface in self.INTERFACES:
+            run("gdbus-codegen", "--interface-prefix", "com.tarno.halvox.", "--generate-c-code", "generated",
+                "--generate-docbook", "page", "--c-namespace", "Halvox", self.file(interface), cwd=self.directory)
 
-        header = (self.directory / "generated.h").read_text()
-        self.assertIn("create_reporting_session", header)
+            header = (self.directory / "generated.h").read_text()
+            calls = {name.replace("_", "") for name in re.findall(r"_call_(\w+) \(", header)}
+            page = (self.directory / f"page-{interface}.xml").read_text()
+            for method in ElementTree.parse(self.file(interface)).iter("method"):
+                self.assertIn(method.get("name").lower(), calls)
+                # The comments become the text of the page. A generator takes one line for an argument, and
+                # the second for the description of the method.
+                description = re.search(rf"<title>The {method.get('name')}\(\) method<.*?<para>\s*(.)", page, re.DOTALL)
+                self.assertTrue(description[1].isupper(), method.get("name"))
+                for argument in method.iter("arg"):
+                    self.assertRegex(page, rf"<parameter>{argument.get('name')}</parameter></literal>:</term>"
+                                           r'\s*<listitem><para>\s*[A-Z"]')
+
+    def test_a_generator_of_qt_knows_each_type(self):
+        """qdbusxml2cpp refuses a type that is not basic, unless an annotation names its type of Qt."""
+        types = {"a{sv}": "QVariantMap", "ax": "QList<qlonglong>", "aax": "QList<QList<qlonglong> >"}
+        for method in ElementTree.parse(self.file()).iter("method"):
+            expected = {}
+            for direction in "in", "out":
+                arguments = [found for found in method.iter("arg") if found.get("direction") == direction]
+                for number, argument in enumerate(arguments):
+                    if len(argument.get("type")) > 1:
+                        name = f"org.qtproject.QtDBus.QtTypeName.{direction.capitalize()}{number}"
+                        expected[name] = types[argument.get("type")]
+            found = {note.get("name"): note.get("value") for note in method.iter("annotation")}
+            self.assertEqual(found, expected, method.get("name"))
 
 
 if __name__ == "__main__":
