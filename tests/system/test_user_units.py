@@ -69,6 +69,14 @@ class UserUnitsTest(Installation):
         self.assertEqual(self.settings(users, "ConditionPathExists"), ["!" + systems])
         self.assertEqual(self.settings(users, "SocketMode"), ["0600"])
 
+    def test_the_file_that_a_user_s_socket_gives_way_to_goes_with_the_socket_of_the_system(self):
+        for manager in "system", "user":
+            socket = self.unit("halvox-reportingd.socket", manager)
+            self.assertEqual(self.settings(socket, "RemoveOnStop"), ["yes"], manager)
+        # systemd keeps the directory of the socket, which belongs to the service, too.
+        service = self.unit("halvox-reportingd.service", "system")
+        self.assertEqual(self.settings(service, "Requires"), ["halvox-reportingd.socket"])
+
     def test_the_reporter_asks_for_the_socket_and_runs_without_it(self):
         if not (self.prefix / "bin/halvox-pipewire-reporter").exists():
             self.skipTest("built without the reporter")
