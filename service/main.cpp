@@ -14,6 +14,7 @@
 #include "platform/linux/runtime/Version.h"
 #include "platform/services.h"
 #include "service/HVReportingServiceDelegate.h"
+#include "service/ReportingQueue.h"
 #include "service/ServiceArguments.h"
 
 namespace {
@@ -31,6 +32,8 @@ int refuse(int exitStatus, const std::string& why) {
 int serve(const Configuration& configuration) {
   LinuxPlatform adapters(configuration);
   platform::installServices(adapters.services());
+  // All requests are carried out on this queue. A service in which it is stuck serves nobody.
+  adapters.watchQueue(gReportingQueueName);
   if (const auto opened = adapters.open(); !opened) {
     static_cast<void>(adapters.close());
     return refuse(opened.error().code, opened.error().message);

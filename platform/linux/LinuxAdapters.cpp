@@ -99,6 +99,7 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
             // while other threads are woken.
             options.afterReplies = [this] { dispatch.wakePool(); };
             options.onReportSignal = std::move(onReportSignal);
+            options.hasProgressed = [this] { return dispatch.hasProgressed(watchedQueue); };
             options.counters = [this] { return readCounters(statistics); };
             return options;
           }(),

@@ -59,6 +59,7 @@ struct LinuxAdapters {
   // The connections are made before everything that has threads, because they block the signals
   // that end the process, and every thread that starts later inherits this.
   const Configuration configuration;
+  std::string watchedQueue;  // see LinuxPlatform::watchQueue()
   CounterStatisticsService statistics;
   Backpressure backpressure;
   LinuxConnectionService connections;

@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <string>
+#include <utility>
 
 #include <malloc.h>
 #include <sysexits.h>
@@ -84,6 +85,8 @@ Services LinuxPlatform::services() {
           .statistics = adapters_->statistics,
           .tlmReporting = adapters_->realTimeLink()};
 }
+
+void LinuxPlatform::watchQueue(std::string label) { adapters_->watchedQueue = std::move(label); }
 
 Result<void, int> LinuxPlatform::open() {
   if (const auto& nats = adapters_->nats; !nats) {

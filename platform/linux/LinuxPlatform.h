@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <string>
 
 #include "platform/linux/base/Result.h"
 #include "platform/object_log.h"
@@ -26,6 +27,9 @@ class LinuxPlatform {
   ~LinuxPlatform();
 
   [[nodiscard]] Services services();
+  // The service manager's watchdog watches the queues of that label, and the main thread. Call it
+  // before the listener's resume().
+  void watchQueue(std::string label);
   // Opens the store, then the socket, so that everything that is accepted can be stored.
   // The services must be installed. The code of a failure is the exit status of the process.
   Result<void, int> open();

@@ -62,6 +62,7 @@ ConnectionHost::ConnectionHost(ConnectionOptions options, Backpressure& backpres
       handshakes_(options_.handshakeTimeout),
       messages_(options_.messageTimeout),
       acceptRetries_(kAcceptRetryDelay),
+      watchdog_(options_.hasProgressed),
       turn_(options_.beginBatch, options_.endBatch, options_.afterReplies) {
   // Block the signals here and not in open(): only threads that are started later inherit the mask.
   // A thread without the mask would receive the signal instead of the loop, and the signal would
@@ -153,6 +154,7 @@ void ConnectionHost::resume() {
   kLog.info("serving ", listeners_.size(), " sockets and ", buses_.size(), " buses");
   static_cast<void>(sd_notifyf(0, "READY=1\nSTATUS=Serving %zu sockets and %zu buses",
                                listeners_.size(), buses_.size()));
+  watchdog_.start();
   while (!stopping_) takeTurn();
   static_cast<void>(sd_notify(0, "STOPPING=1\nSTATUS=Completing the requests that were read"));
   shutDown();
@@ -185,7 +187,8 @@ bool ConnectionHost::maySleep() { return !turn_.hasWork() && inbox_->trySleep();
 
 std::optional<DeadlineQueue::Clock::time_point> ConnectionHost::firstDeadline() const {
   std::optional<DeadlineQueue::Clock::time_point> first;
-  for (const DeadlineQueue* queue : {&handshakes_, &messages_, &acceptRetries_}) {
+  for (const DeadlineQueue* queue :
+       {&handshakes_, &messages_, &acceptRetries_, &watchdog_.looks()}) {
     const auto due = queue->first();
     if (due.has_value() && (!first.has_value() || *due < *first)) first = due;
   }
@@ -196,7 +199,9 @@ void ConnectionHost::expireDeadlines() {
   // Most turns have no deadline, and this saves them reading the clock.
   if (!firstDeadline().has_value()) return;
   const auto now = DeadlineQueue::Clock::now();
-  for (DeadlineQueue* queue : {&handshakes_, &messages_, &acceptRetries_}) queue->expire(now);
+  for (DeadlineQueue* queue : {&handshakes_, &messages_, &acceptRetries_, &watchdog_.looks()}) {
+    queue->expire(now);
+  }
 }
 
 void ConnectionHost::readMail() {

@@ -18,6 +18,7 @@
 #include "platform/linux/connection/RequestDispatcher.h"
 #include "platform/linux/connection/SocketFile.h"
 #include "platform/linux/connection/TurnSchedule.h"
+#include "platform/linux/connection/Watchdog.h"
 #include "platform/linux/connection/wire/Frame.h"
 
 namespace halvox::platform::linux_ {
@@ -106,6 +107,7 @@ class ConnectionHost final : public NSXPCListener {
   DeadlineQueue handshakes_;
   DeadlineQueue messages_;
   DeadlineQueue acceptRetries_;
+  Watchdog watchdog_;
   ReadScratch scratch_;
   dbus::HeaderCache headers_;
   OutputBufferPool outputBuffers_;

@@ -63,6 +63,10 @@ struct ConnectionOptions {
   std::function<void()> afterReplies;
   // Called on the I/O thread at SIGUSR1, if `signals` is kHandle.
   std::function<void()> onReportSignal;
+  // Called on the I/O thread, if the service manager has a watchdog for this process. Returns false
+  // if the service is stuck since the last call although the I/O thread runs. The manager then gets
+  // no keep-alive messages.
+  std::function<bool()> hasProgressed;
   // Called on the I/O thread for each client that asks for the counters. Returns the value of each
   // counter by "piece, name". Without it the service answers with no counters.
   std::function<Dictionary()> counters;

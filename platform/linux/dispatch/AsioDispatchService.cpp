@@ -74,6 +74,16 @@ QueueLabels::Jobs AsioDispatchService::jobs() {
   return sum;
 }
 
+bool AsioDispatchService::hasProgressed(std::string_view label) {
+  const MutexLock lock(mutex_);
+  bool hasProgressed = true;
+  for (const auto& queue : ownThreadQueues_) {
+    // Ask each queue, because each notes what it has done so far.
+    if (queue->label() == label && !queue->hasProgressed()) hasProgressed = false;
+  }
+  return hasProgressed;
+}
+
 bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
   const auto deadline = std::chrono::steady_clock::now() + limit;
   std::vector<std::shared_ptr<OwnThreadQueue>> queues;

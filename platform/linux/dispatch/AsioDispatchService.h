@@ -76,6 +76,12 @@ class AsioDispatchService final : public DispatchService {
   // that are not due. Returns 0, or the number of jobs that had not run at the limit. Must not be
   // called from a job.
   [[nodiscard]] std::uint64_t finish(const FinishLimits& limits);
+  // For a watchdog: returns false if a queue with a thread of its own and that label has been stuck
+  // since the last call. Such a queue has a job, but no job has ended and its thread has used no
+  // processor time. A job that computes for minutes is therefore never taken for stuck, nor is a
+  // job that waits on a semaphore: others work for it, and the stop of a traced session waits for
+  // its trace without a time limit.
+  [[nodiscard]] bool hasProgressed(std::string_view label);
   // Ends each thread after the job that it runs. Discards and counts all other jobs, and those that
   // are added later. Waits at most for `limit`. If a job still runs then, logs the labels of the
   // stuck queues and returns false; the process should then end without destroying this object. May

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <memory>
 #include <string_view>
 #include <utility>
@@ -20,7 +21,8 @@ class SharedQueue;
 //
 // This is the only thread-local object of the adapter. It must be thread-local because the inner
 // ring, which calls DispatchQueue::async(), has no batch that it could pass. Belongs to its thread;
-// no other thread may use it. When the thread ends, the destructor ends helping and holding.
+// other threads may only ask whether it waits. When the thread ends, the destructor ends helping
+// and holding.
 class DispatchThread {
  public:
   // Returns the calling thread's object.
@@ -52,6 +54,19 @@ class DispatchThread {
     const DispatchQueue* outerQueue_;
     std::string_view outerLabel_;  // owned by the outer queue
   };
+  // While this object exists, the calling thread is marked as waiting for other threads.
+  class Waiting {
+   public:
+    Waiting() : thread_(current()) { thread_.waits_.store(true, std::memory_order_relaxed); }
+    Waiting(const Waiting&) = delete;
+    Waiting& operator=(const Waiting&) = delete;
+    ~Waiting() { thread_.waits_.store(false, std::memory_order_relaxed); }
+
+   private:
+    DispatchThread& thread_;
+  };
+  // Any thread may call this function.
+  [[nodiscard]] bool waits() const { return waits_.load(std::memory_order_relaxed); }
   [[nodiscard]] bool worksFor(const DispatchQueue* queue) const { return queue_ == queue; }
   [[nodiscard]] std::string_view label() const { return label_; }
 
@@ -75,6 +90,8 @@ class DispatchThread {
  private:
   const DispatchQueue* queue_ = nullptr;
   std::string_view label_;  // owned by the maker of the innermost Working
+  // Relaxed, because a reader draws no conclusion about other data from it.
+  std::atomic<bool> waits_{false};
   bool isHelping_ = false;
   bool isHoldingPool_ = false;
   // Both lists keep their capacity between batches.

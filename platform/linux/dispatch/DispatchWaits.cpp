@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "platform/linux/dispatch/DispatchPool.h"
+#include "platform/linux/dispatch/DispatchThread.h"
 #include "platform/linux/dispatch/SharedQueue.h"
 
 namespace halvox::platform::linux_ {
@@ -128,6 +129,9 @@ void DispatchWaits::discard() {
 
 void SharedSemaphore::signal() { pool_->waits().signal(*this); }
 
-void SharedSemaphore::wait() { pool_->waits().block(*this); }
+void SharedSemaphore::wait() {
+  const DispatchThread::Waiting waiting;
+  pool_->waits().block(*this);
+}
 
 }  // namespace halvox::platform::linux_

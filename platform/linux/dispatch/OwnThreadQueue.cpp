@@ -1,7 +1,10 @@
 #include "platform/linux/dispatch/OwnThreadQueue.h"
 
+#include <ctime>
 #include <stdexcept>
 #include <utility>
+
+#include <pthread.h>
 
 #include "platform/linux/dispatch/ThreadPriorities.h"
 
@@ -105,7 +108,12 @@ bool OwnThreadQueue::waitForEnd(std::chrono::steady_clock::time_point deadline) 
 void OwnThreadQueue::run() {
   setUpThread(label_, priorityFor(quality_));
   const DispatchThread::Working working(this, label_);
-  work(DispatchThread::current());
+  DispatchThread& thread = DispatchThread::current();
+  {
+    const MutexLock lock(mutex_);
+    if (::pthread_getcpuclockid(::pthread_self(), &ownClock_) == 0) ownThread_ = &thread;
+  }
+  work(thread);
   end();
 }
 
@@ -143,6 +151,7 @@ void OwnThreadQueue::end() {
   if (next_ < batch_.size()) runner_->countDiscarded(batch_.size() - next_);
   batch_.clear();
   const MutexLock lock(mutex_);
+  ownThread_ = nullptr;  // the thread's object and clock end with the thread
   hasEnded_ = true;
   ended_.notifyAll();
 }
@@ -194,6 +203,24 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
 QueueLabels::Jobs OwnThreadQueue::jobs() const {
   const MutexLock lock(mutex_);
   return {.added = added_, .run = ran_.load(std::memory_order_relaxed)};
+}
+
+OwnThreadQueue::Progress OwnThreadQueue::progress() const {
+  timespec used{};
+  static_cast<void>(::clock_gettime(ownClock_, &used));
+  return {
+      .jobs = ran_.load(std::memory_order_relaxed),
+      .processorTime = std::chrono::seconds(used.tv_sec) + std::chrono::nanoseconds(used.tv_nsec)};
+}
+
+bool OwnThreadQueue::hasProgressed() {
+  const MutexLock lock(mutex_);
+  // Without the own thread, the queue has just started or has ended.
+  if (ownThread_ == nullptr) return true;
+  const Progress now = progress();
+  const Progress before = std::exchange(seen_, now);
+  const bool isIdle = !hasWorker_ && !hasWork();
+  return isIdle || now != before || ownThread_->waits();
 }
 
 bool OwnThreadQueue::hasWork() const {

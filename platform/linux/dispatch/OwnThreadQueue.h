@@ -11,6 +11,8 @@
 #include <thread>
 #include <vector>
 
+#include <sys/types.h>
+
 #include "platform/dispatch.h"
 #include "platform/linux/base/Mutex.h"
 #include "platform/linux/dispatch/DispatchThread.h"
@@ -73,12 +75,21 @@ class OwnThreadQueue final : public DispatchQueue,
   // The numbers of jobs that were added and that have run. After stop() the discarded jobs count
   // only as added.
   [[nodiscard]] QueueLabels::Jobs jobs() const HALVOX_EXCLUDES(mutex_);
+  // Returns false if the queue has been stuck since the last call: it has a job, no job has ended,
+  // its thread has used no processor time, and the job does not wait on a semaphore.
+  [[nodiscard]] bool hasProgressed() HALVOX_EXCLUDES(mutex_);
 
  private:
   enum class Life : std::uint8_t { kOpen, kClosed, kStopped };
   struct Item {
     Job job;
     JobWeight weight = JobWeight::kBrief;
+  };
+  // What changes while the queue makes progress.
+  struct Progress {
+    std::uint64_t jobs = 0;
+    std::chrono::nanoseconds processorTime{0};  // of the own thread
+    bool operator==(const Progress&) const = default;
   };
 
   OwnThreadQueue(std::string label, QualityOfService quality, std::shared_ptr<JobRunner> runner);
@@ -90,6 +101,7 @@ class OwnThreadQueue final : public DispatchQueue,
   [[nodiscard]] bool takeBatch() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool takeWakeUp() HALVOX_REQUIRES(mutex_);
   void endTurnIfIdle() HALVOX_REQUIRES(mutex_);
+  [[nodiscard]] Progress progress() const HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool canGoOn() const;
   void runNext();
   void runNextInBatch(DispatchThread& thread);
@@ -114,6 +126,10 @@ class OwnThreadQueue final : public DispatchQueue,
   // The thread that will help this queue, or null. Brief jobs that it adds do not wake the own
   // thread.
   const DispatchThread* helper_ HALVOX_GUARDED_BY(mutex_) = nullptr;
+  // The own thread while it runs, otherwise null, and its clock of processor time.
+  const DispatchThread* ownThread_ HALVOX_GUARDED_BY(mutex_) = nullptr;
+  clockid_t ownClock_ HALVOX_GUARDED_BY(mutex_) = 0;
+  Progress seen_ HALVOX_GUARDED_BY(mutex_);  // at the last hasProgressed()
   // Lets the worker end a batch early without taking the lock for each job. Relaxed, because
   // `life_` decides.
   std::atomic<bool> isStopped_{false};
