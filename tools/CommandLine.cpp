@@ -11,6 +11,7 @@
 #include "tools/CommandSet.h"
 #include "tools/JsonText.h"
 #include "tools/commands/Commands.h"
+#include "tools/reference/CommandTree.h"
 
 namespace halvox::tools {
 namespace {
@@ -191,19 +192,8 @@ CommandLineText describe(const CLI::ParseError& error, const CLI::App& app, Comm
   return {ExitStatus::kBadArguments, std::move(text), std::move(command), reason};
 }
 
-}  // namespace
-
-bool asksForJson(const std::vector<std::string>& arguments) {
-  // What follows "--" belongs to another program (trace record) and may have a --json of its own.
-  const auto end = std::ranges::find(arguments, "--");
-  return std::find(arguments.begin(), end, "--json") != end;
-}
-
-std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string> arguments,
-                                                        CommandSource source, std::istream& input) {
-  CLI::App app("Talks to the Halvox reporting service, and shows what it stored.");
-  nameThings(app);
-  CommandSet commands(app, source, input);
+// Adds all commands of `source` to `app`, which has the parser's settings but no commands yet.
+void addEverything(CLI::App& app, CommandSet& commands, CommandSource source) {
   if (source == CommandSource::kScriptLine) {
     app.description(
         "Requests to the Halvox reporting service, one on each line, over one connection.");
@@ -218,6 +208,34 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
   app.require_subcommand(1);
   addGroups(commands, source);
   removeTypeNames(app);
+}
+
+constexpr const char* kWhatItIs =
+    "Talks to the Halvox reporting service, and shows what it stored.";
+
+}  // namespace
+
+bool asksForJson(const std::vector<std::string>& arguments) {
+  // What follows "--" belongs to another program (trace record) and may have a --json of its own.
+  const auto end = std::ranges::find(arguments, "--");
+  return std::find(arguments.begin(), end, "--json") != end;
+}
+
+DescribedCommand describeCommandLine() {
+  CLI::App app(kWhatItIs);
+  nameThings(app);
+  std::istringstream noInput;
+  CommandSet commands(app, CommandSource::kArguments, noInput);
+  addEverything(app, commands, CommandSource::kArguments);
+  return describeCommands(app);
+}
+
+std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string> arguments,
+                                                        CommandSource source, std::istream& input) {
+  CLI::App app(kWhatItIs);
+  nameThings(app);
+  CommandSet commands(app, source, input);
+  addEverything(app, commands, source);
 
   std::ranges::reverse(arguments);  // as the library wants them
   // The library reports everything with exceptions. None leaves this function.

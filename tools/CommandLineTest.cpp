@@ -1,8 +1,5 @@
 #include "tools/CommandLine.h"
 
-#include <fstream>
-#include <iterator>
-#include <regex>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -456,19 +453,6 @@ TEST(CommandLineTest, ExportNamesTheFormsThatItHas) {
   EXPECT_NE(errorOf({"export"}).find("--output"), std::string::npos);
   EXPECT_NE(errorOf({"export", "--format", "perfetto", "--kind", "link"}).find("shows streams"),
             std::string::npos);
-}
-
-// The completion is a separate file, in which a new command is easily forgotten.
-TEST(CommandLineTest, TheShellCompletesEveryCommand) {
-  std::ifstream file(HALVOX_COMPLETION);
-  const std::string text{std::istreambuf_iterator<char>(file), {}};
-  const auto begin = text.find("commands=\"");
-  ASSERT_NE(begin, std::string::npos);
-  const std::string listed = text.substr(begin, text.find("\n  local common", begin) - begin);
-  for (const Words& words : allCommands()) {
-    const std::regex word("[\\s\"]" + words.front() + "[\\s\"]");
-    EXPECT_TRUE(std::regex_search(listed, word)) << words.front();
-  }
 }
 
 TEST(CommandLineTest, HelpOnCreateSaysHowLongASessionLives) {

@@ -34,6 +34,7 @@ void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
                                 "$XDG_RUNTIME_DIR/halvox/reporting.sock, if a service is there, "
                                 "else the system's, /run/halvox/reporting.sock)")
                      ->type_name("PATH");
+  offerFiles(socket);
   auto* timeout = addParsed(app, "--timeout", options_.timeout, parseSeconds,
                             "How long to wait for an answer (default: 5)")
                       ->type_name("SECONDS");

@@ -13,6 +13,7 @@
 #include "tools/Arguments.h"
 #include "tools/Command.h"
 #include "tools/CommandLine.h"
+#include "tools/OfferedValues.h"
 
 // Helpers with which the files in tools/commands/ define the arguments of commands.
 namespace halvox::tools {

@@ -97,7 +97,9 @@ class SystemFilesTest(Installation):
                      "share/dbus-1/system-services/com.tarno.halvox.reporting.service",
                      f"share/dbus-1/interfaces/{INTERFACE}.xml",
                      "share/dbus-1/interfaces/com.tarno.halvox.Statistics.xml",
-                     "share/bash-completion/completions/halvoxctl", "share/man/man1/halvoxctl.1",
+                     "share/bash-completion/completions/halvoxctl",
+                     "share/zsh/vendor-completions/_halvoxctl", "share/fish/vendor_completions.d/halvoxctl.fish",
+                     "share/man/man1/halvoxctl.1",
                      "share/doc/halvox/examples/systemd/link-nats.conf",
                      "share/doc/halvox/examples/systemd/pipewire.conf",
                      "include/halvox.h", "include/halvox_trace.h"):

@@ -11,10 +11,10 @@ import tempfile
 import unittest
 from pathlib import Path
 
-from harness import CTL, DEADLINE, Follower, Service, wait_for
+from harness import BIN, CTL, DEADLINE, Follower, Service, wait_for
 from tracing import interval
 
-COMPLETION = Path(__file__).resolve().parents[2] / "packaging/completions/halvoxctl"
+COMPLETION = BIN.parent / "reference/halvoxctl"
 SCRIPT = """\
 create 7
 set-type 7 longformaudio

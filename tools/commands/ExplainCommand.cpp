@@ -18,10 +18,12 @@ void addExplainCommand(CommandSet& commands) {
                   "said to have taken a message only if the store shows it. Shows the settings "
                   "that decide, as they are in the configuration file now, and what the store "
                   "does not show."});
-  app.add_option("TARGET", request->target,
-                 "The name of an event, such as com.tarno.halvox.Session_Playback.Start or "
-                 "Session_Playback.Start, or the ID of a session or of a stored message")
-      ->required();
+  offerLive(
+      app.add_option("TARGET", request->target,
+                     "The name of an event, such as com.tarno.halvox.Session_Playback.Start or "
+                     "Session_Playback.Start, or the ID of a session or of a stored message")
+          ->required(),
+      "event_names");
   addTimes(app, request->since, request->until, "records");
   addDatabase(app, request->database);
   commands.onRun(

@@ -45,6 +45,20 @@ Result<ExportKind> parseKind(std::string_view text) {
                    names};
 }
 
+std::vector<std::string> formatNames() {
+  std::vector<std::string> names;
+  names.reserve(std::size(kFormats));
+  for (const auto& [name, format] : kFormats) names.emplace_back(name);
+  return names;
+}
+
+std::vector<std::string> kindNames() {
+  std::vector<std::string> names;
+  names.reserve(std::size(kKinds));
+  for (const ExportKind kind : kKinds) names.emplace_back(wordOf(kind));
+  return names;
+}
+
 ExportKinds kindsOf(const std::vector<ExportKind>& asked) {
   if (asked.empty()) return {};
   const auto has = [&](ExportKind kind) {
@@ -85,24 +99,33 @@ void addExportCommand(CommandSet& commands) {
                   "  halvoxctl export --format jsonl --app 'org.example.*' | jq .payload",
        .details = "A file gets its name when it is complete. docs/export.md describes the formats.",
        .reach = CommandReach::kFiles});
-  addParsed(app, "--format", request->format, parseFormat,
-            "sqlite: a database with six plain tables (default); jsonl: one JSON object a line; "
-            "csv: one table for spreadsheets; otlp-json: log records of OpenTelemetry, one request "
-            "a line; perfetto: a trace of the streams for Perfetto's viewer")
-      ->type_name("FORMAT");
-  app.add_option("-o,--output,--to", request->to,
-                 "The file to write; - is the standard output (default, except for sqlite)")
-      ->type_name("FILE");
+  offerWords(
+      addParsed(
+          app, "--format", request->format, parseFormat,
+          "sqlite: a database with six plain tables (default); jsonl: one JSON object a line; "
+          "csv: one table for spreadsheets; otlp-json: log records of OpenTelemetry, one request "
+          "a line; perfetto: a trace of the streams for Perfetto's viewer")
+          ->type_name("FORMAT"),
+      formatNames());
+  offerFiles(
+      app.add_option("-o,--output,--to", request->to,
+                     "The file to write; - is the standard output (default, except for sqlite)")
+          ->type_name("FILE"),
+      {"-"});
   app.add_flag("--force", request->replace, "Replace the file if it exists");
-  addEach(app, "--kind", *kinds, parseKind,
-          "Only records of this kind: events, metrics, power, link, snapshots or losses")
-      ->type_name("KIND");
-  app.add_option("--app", request->applications,
-                 "Only records of applications that match this glob pattern; may be given several "
-                 "times")
-      ->type_name("GLOB")
-      ->expected(1)
-      ->take_all();
+  offerWords(addEach(app, "--kind", *kinds, parseKind,
+                     "Only records of this kind: events, metrics, power, link, snapshots or losses")
+                 ->type_name("KIND"),
+             kindNames());
+  offerLive(
+      app.add_option(
+             "--app", request->applications,
+             "Only records of applications that match this glob pattern; may be given several "
+             "times")
+          ->type_name("GLOB")
+          ->expected(1)
+          ->take_all(),
+      "applications");
   addTimes(app, request->since, request->until, "records");
   addDatabase(app, request->database);
   commands.onRun(

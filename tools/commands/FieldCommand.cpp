@@ -9,19 +9,22 @@ namespace halvox::tools {
 namespace {
 
 void addFilters(CLI::App& app, ShowFields& request) {
-  app.add_option("--app", request.applications,
-                 "Only events of applications that match this glob pattern; may be given several "
-                 "times")
-      ->type_name("GLOB")
-      ->expected(1)
-      ->take_all();
-  addEach(app, "--category", request.categories, parseCategory,
-          "Only messages of this category: a name such as Session_Playback, or a number. A "
-          "category without a domain, such as Playback, stands for all domains")
-      ->type_name("CATEGORY");
-  addEach(app, "--type", request.types, parseEventType,
-          "Only messages of this type: a name such as Start, or a number")
-      ->type_name("TYPE");
+  offerLive(app.add_option(
+                   "--app", request.applications,
+                   "Only events of applications that match this glob pattern; may be given several "
+                   "times")
+                ->type_name("GLOB")
+                ->expected(1)
+                ->take_all(),
+            "applications");
+  offerCategories(
+      addEach(app, "--category", request.categories, parseCategory,
+              "Only messages of this category: a name such as Session_Playback, or a number. A "
+              "category without a domain, such as Playback, stands for all domains")
+          ->type_name("CATEGORY"));
+  offerEventTypes(addEach(app, "--type", request.types, parseEventType,
+                          "Only messages of this type: a name such as Start, or a number")
+                      ->type_name("TYPE"));
   addTimes(app, request.since, request.until, "records");
   addDatabase(app, request.database);
 }

@@ -3,6 +3,7 @@
 #include <string>
 #include <vector>
 
+#include "client/Vocabulary.h"
 #include "tools/Events.h"
 #include "tools/Records.h"
 #include "tools/commands/Commands.h"
@@ -25,25 +26,27 @@ ExitStatus runRecords(const ShowRecords& request, const CommonOptions& options,
                      streams.errors);
 }
 
-void addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numbers,
-                const char* description) {
-  addEach(app, name, numbers, parseNumber, description)->type_name("N");
+CLI::Option* addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numbers,
+                        const char* description) {
+  return addEach(app, name, numbers, parseNumber, description)->type_name("N");
 }
 
 template <typename Targets>
 void addCategories(CLI::App& app, Targets& categories, const std::string& records) {
-  addEach(app, "--category", categories, parseCategory,
+  offerCategories(
+      addEach(
+          app, "--category", categories, parseCategory,
           "Only " + records +
               " of this category: a name such as Session_Playback, or a number. A category without "
               "a domain, such as Playback, stands for all domains")
-      ->type_name("CATEGORY");
+          ->type_name("CATEGORY"));
 }
 
 template <typename Targets>
 void addTypes(CLI::App& app, Targets& types, const std::string& records) {
-  addEach(app, "--type", types, parseEventType,
-          "Only " + records + " of this type: a name such as Start, or a number")
-      ->type_name("TYPE");
+  offerEventTypes(addEach(app, "--type", types, parseEventType,
+                          "Only " + records + " of this type: a name such as Start, or a number")
+                      ->type_name("TYPE"));
 }
 
 // Adds a command that shows the records of one kind. Its options are parsed into `request`.
@@ -73,22 +76,29 @@ void addEvents(CommandSet& commands) {
                                "about connections of halvoxctl itself; --own shows it. --json has "
                                "everything.",
                     .reach = CommandReach::kFiles});
-  events
-      .add_option("--app", request->applications,
-                  "Only events of applications that match this glob pattern; may be given several "
-                  "times")
-      ->type_name("GLOB")
-      ->expected(1)
-      ->take_all();
-  addNumbers(events, "--session", request->sessions,
-             "Only events of messages that the link's local back-end stored for this session (-1: "
-             "outside any session)");
+  auto* applications =
+      events
+          .add_option(
+              "--app", request->applications,
+              "Only events of applications that match this glob pattern; may be given several "
+              "times")
+          ->type_name("GLOB")
+          ->expected(1)
+          ->take_all();
+  offerLive(applications, "applications");
+  offerLive(
+      addNumbers(
+          events, "--session", request->sessions,
+          "Only events of messages that the link's local back-end stored for this session (-1: "
+          "outside any session)"),
+      "stored_sessions");
   addCategories(events, request->categories, "events");
   addTypes(events, request->types, "events");
   events.add_flag("--all-names", request->hasAllNames, "Show both events of each message");
   events.add_flag("--own", request->hasOwnEvents,
                   "Also show events about connections of halvoxctl itself");
   addSelection(events, request->selection, "events", "--name");
+  offerLive(events.get_option("--name"), "event_names");
   // The link stores a message later than its events.
   events.get_option("--session")->excludes(events.get_option("--follow"));
   commands.onRun(
@@ -117,6 +127,7 @@ void addPower(CommandSet& commands) {
                                request);
   addNumbers(power, "--category", request->categories, "Only events of this category");
   addSelection(power, request->selection, "power events", "--name");
+  offerLive(power.get_option("--name"), "power_event_names");
 }
 
 void addLink(CommandSet& commands) {
@@ -127,11 +138,18 @@ void addLink(CommandSet& commands) {
                                .example = "halvoxctl link --session 7 --follow",
                                .reach = CommandReach::kFiles},
                               request);
-  addNumbers(link, "--session", request->ids,
-             "Only messages of this session (-1: those outside any session)");
+  offerLive(addNumbers(link, "--session", request->ids,
+                       "Only messages of this session (-1: those outside any session)"),
+            "stored_sessions");
   addCategories(link, request->categories, "messages");
   addTypes(link, request->types, "messages");
   addSelection(link, request->selection, "messages", "--service");
+  std::vector<std::string> services;
+  for (const auto& type : client::serviceTypes()) {
+    services.emplace_back(type.name);
+    services.push_back(std::string(type.name) + "_session");
+  }
+  offerWords(link.get_option("--service"), services);
 }
 
 }  // namespace

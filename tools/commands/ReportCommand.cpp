@@ -59,18 +59,22 @@ void addReportCommand(CommandSet& commands) {
                   "table for each picture. With --compare it shows what got worse between two "
                   "days, periods or stores, and how sure that is; without -o that is a table.",
        .reach = CommandReach::kFiles});
-  report
-      .add_option("-o,--output", arguments->report.to,
-                  "The file to write, replaced if it exists; - is the standard output")
-      ->type_name("FILE");
-  report
-      .add_option("--compare", arguments->compared,
-                  "Compare AFTER with BEFORE. Each is a day (yesterday, 2026-11-21), SINCE..UNTIL "
-                  "with times as below, or the path of a store (./before/halvox.db)")
-      ->type_name("BEFORE AFTER")
-      // Two texts of one value. With expected(2), the help would say "BEFORE AFTER x 2".
-      ->type_size(2)
-      ->expected(1);
+  offerFiles(report
+                 .add_option("-o,--output", arguments->report.to,
+                             "The file to write, replaced if it exists; - is the standard output")
+                 ->type_name("FILE"),
+             {"-"});
+  auto* compare =
+      report
+          .add_option(
+              "--compare", arguments->compared,
+              "Compare AFTER with BEFORE. Each is a day (yesterday, 2026-11-21), SINCE..UNTIL "
+              "with times as below, or the path of a store (./before/halvox.db)")
+          ->type_name("BEFORE AFTER")
+          // Two texts of one value. With expected(2), the help would say "BEFORE AFTER x 2".
+          ->type_size(2)
+          ->expected(1);
+  offerFiles(compare, {"yesterday", "today"});
   addTimes(report, arguments->report.since, arguments->report.until, "records");
   addDatabase(report, arguments->report.database);
   commands.onRun(

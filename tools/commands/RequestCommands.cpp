@@ -42,7 +42,9 @@ void onRequest(CommandSet& commands, CLI::App& app, const SharedArguments& argum
 }
 
 void addID(CLI::App& app, const SharedArguments& arguments) {
-  addParsed(app, "ID", arguments->id, parseReporterID, "The session's reporter ID")->required();
+  offerLive(
+      addParsed(app, "ID", arguments->id, parseReporterID, "The session's reporter ID")->required(),
+      "sessions");
 }
 
 void addJson(CommandSet& commands, CLI::App& app, const SharedArguments& arguments,
@@ -73,8 +75,9 @@ void addSetType(CommandSet& commands) {
                                 .summary = "Set a session's service type",
                                 .example = "halvoxctl set-type 7 telephony"});
   addID(app, arguments);
-  addParsed(app, "TYPE", arguments->serviceType, parseServiceType, "A service type: name or number")
-      ->required();
+  offerServiceTypes(addParsed(app, "TYPE", arguments->serviceType, parseServiceType,
+                              "A service type: name or number")
+                        ->required());
   onRequest(commands, app, arguments, [](const Arguments& given) {
     return SetType{given.id, given.serviceType};
   });
@@ -136,16 +139,19 @@ void addSend(CommandSet& commands) {
                     .summary = "Send a message to sessions, also to those of other clients",
                     .example = "halvoxctl send --id 7 --category Session_Playback --type "
                                "Start '{\"sample_rate\": 48000}'"});
-  addEach(app, "--id", arguments->ids, parseReporterID, "A session that the message is for")
-      ->type_name("ID");
+  offerLive(
+      addEach(app, "--id", arguments->ids, parseReporterID, "A session that the message is for")
+          ->type_name("ID"),
+      "sessions");
   app.add_flag("--all", arguments->isToAll, "The message is for all active sessions");
-  addParsed(app, "--category", arguments->category, parseCategory,
-            "Name or number, such as Session_Playback")
-      ->type_name("CATEGORY")
-      ->required();
-  addParsed(app, "--type", arguments->eventType, parseEventType, "Name or number, such as Start")
-      ->type_name("TYPE")
-      ->required();
+  offerCategories(addParsed(app, "--category", arguments->category, parseCategory,
+                            "Name or number, such as Session_Playback")
+                      ->type_name("CATEGORY")
+                      ->required());
+  offerEventTypes(addParsed(app, "--type", arguments->eventType, parseEventType,
+                            "Name or number, such as Start")
+                      ->type_name("TYPE")
+                      ->required());
   addJson(commands, app, arguments, "The message");
   onRequest(commands, app, arguments, makeSend);
 }

@@ -51,7 +51,9 @@ void addScriptCommands(CommandSet& commands) {
        .summary = "Carry out the commands in a file, one on each line, over one connection",
        .example = "printf 'create 7\\nstart 7\\nstop 7\\n' | halvoxctl run -",
        .details = kScriptNote});
-  run.add_option("FILE", script->file, "The file; \"-\" reads standard input")->required();
+  offerFiles(
+      run.add_option("FILE", script->file, "The file; \"-\" reads standard input")->required(),
+      {"-"});
   run.add_flag("--keep-going", script->keepGoing, "Continue after lines that fail");
   commands.onRun(
       run, [script] { return *script; }, runFile);

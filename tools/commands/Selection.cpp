@@ -1,6 +1,7 @@
 #include "tools/commands/Selection.h"
 
 #include <string>
+#include <vector>
 
 #include "platform/linux/base/Result.h"
 #include "tools/Arguments.h"
@@ -30,24 +31,31 @@ void addCursors(CLI::App& app, RecordSelection& selection, const std::string& re
 
 void addTimes(CLI::App& app, std::optional<double>& since, std::optional<double>& until,
               const char* records) {
-  addParsed(app, "--since", since, parseTimeNow,
-            "Only " + std::string(records) +
-                " since TIME: a time that a command printed, \"2026-11-21 22:44\", 2026-11-21, RFC "
-                "3339 with an "
-                "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
-                "@SECONDS since 1970")
-      ->type_name("TIME");
-  addParsed(app, "--until", until, parseTimeNow,
-            "Only " + std::string(records) + " before TIME, in the forms of --since")
-      ->type_name("TIME");
+  const std::vector<std::string> times{"today", "yesterday", "now", "5min", "1h", "1d", "1w"};
+  offerWords(
+      addParsed(
+          app, "--since", since, parseTimeNow,
+          "Only " + std::string(records) +
+              " since TIME: a time that a command printed, \"2026-11-21 22:44\", 2026-11-21, RFC "
+              "3339 with an "
+              "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
+              "@SECONDS since 1970")
+          ->type_name("TIME"),
+      times);
+  offerWords(addParsed(app, "--until", until, parseTimeNow,
+                       "Only " + std::string(records) + " before TIME, in the forms of --since")
+                 ->type_name("TIME"),
+             times);
 }
 
 void addDatabase(CLI::App& app, std::string& database) {
-  app.add_option("--database", database,
-                 "The store: a halvox.db or its directory (default: what the configuration names, "
-                 "else the user's, $XDG_STATE_HOME/halvox or ~/.local/state/halvox, if there is "
-                 "one, else the system's, /var/lib/halvox)")
-      ->type_name("FILE");
+  offerFiles(
+      app.add_option(
+             "--database", database,
+             "The store: a halvox.db or its directory (default: what the configuration names, "
+             "else the user's, $XDG_STATE_HOME/halvox or ~/.local/state/halvox, if there is "
+             "one, else the system's, /var/lib/halvox)")
+          ->type_name("FILE"));
 }
 
 void addSelection(CLI::App& app, RecordSelection& selection, const char* records,

@@ -40,19 +40,25 @@ void addPreferences(CommandSet& commands) {
                   "They cannot change tables with lines of their own; edit the file for that.\nPut "
                   "-- before a VALUE that begins with -.",
        .reach = CommandReach::kFiles});
-  addParsed(preferences, "ACTION", request->action, parseAction, "get, set or unset")->required();
-  preferences.add_option("DOMAIN", request->domain, "A domain, such as com.tarno.halvox")
-      ->required();
-  preferences.add_option("KEY", request->key, "A key; without one, get shows all keys");
+  offerWords(addParsed(preferences, "ACTION", request->action, parseAction, "get, set or unset")
+                 ->required(),
+             {"get", "set", "unset"});
+  offerWords(
+      preferences.add_option("DOMAIN", request->domain, "A domain, such as com.tarno.halvox")
+          ->required(),
+      {"com.tarno.halvox", "com.tarno.pavisk"});
+  offerWords(preferences.add_option("KEY", request->key, "A key; without one, get shows all keys"),
+             {"device_name", "disable_reporting", "spatial-audio-accessory-feature"});
   preferences.add_option("VALUE", request->value,
                          "A TOML value; anything else is taken as a string");
   preferences.add_flag("--string", request->isString, "Always take VALUE as a string");
   preferences.add_option("--user", request->user, "Whose settings (default: mobile)")
       ->type_name("USER");
-  preferences
-      .add_option("--directory", request->directory,
-                  "Where the preferences are (default: as the service's configuration says)")
-      ->type_name("DIRECTORY");
+  offerDirectories(
+      preferences
+          .add_option("--directory", request->directory,
+                      "Where the preferences are (default: as the service's configuration says)")
+          ->type_name("DIRECTORY"));
   commands.onRun(
       preferences, [request] { return checked(*request); },
       [](const Preferences& asked, const CommonOptions& options, const ToolStreams& streams) {
@@ -66,15 +72,19 @@ void addNotify(CommandSet& commands) {
                                    .summary = "Post a notification to the service",
                                    .example = "halvoxctl notify com.tarno.halvox.reporting",
                                    .reach = CommandReach::kFiles});
-  notify
-      .add_option("NAME", request->name,
-                  "The notification: com.tarno.halvox.reporting or "
-                  "com.tarno.pavisk.spatial-audio-accessory-feature.changed")
-      ->required();
-  notify
-      .add_option("--directory", request->directory,
-                  "Where the service looks for notifications (default: as its configuration says)")
-      ->type_name("DIRECTORY");
+  offerWords(
+      notify
+          .add_option("NAME", request->name,
+                      "The notification: com.tarno.halvox.reporting or "
+                      "com.tarno.pavisk.spatial-audio-accessory-feature.changed")
+          ->required(),
+      {"com.tarno.halvox.reporting", "com.tarno.pavisk.spatial-audio-accessory-feature.changed"});
+  offerDirectories(
+      notify
+          .add_option(
+              "--directory", request->directory,
+              "Where the service looks for notifications (default: as its configuration says)")
+          ->type_name("DIRECTORY"));
   commands.onRun(
       notify, [request] { return *request; },
       [](const PostNotification& asked, const CommonOptions& options, const ToolStreams& streams) {

@@ -9,8 +9,10 @@ namespace halvox::tools {
 namespace {
 
 void addFile(CLI::App& app, std::string& file) {
-  app.add_option("FILE", file, "The archive; \"newest\" stands for the newest one of the service")
-      ->required();
+  offerFiles(app.add_option("FILE", file,
+                            "The archive; \"newest\" stands for the newest one of the service")
+                 ->required(),
+             {"newest"});
 }
 
 void addShow(CommandSet& commands, CLI::App& snapshots) {
@@ -36,11 +38,12 @@ void addExtract(CommandSet& commands, CLI::App& snapshots) {
                   .example = "halvoxctl snapshots extract newest --to /tmp/snapshot",
                   .reach = CommandReach::kFiles});
   addFile(extract, request->file);
-  extract
-      .add_option(
-          "--to", request->directory,
-          "The directory to unpack into, created if needed (default: named like the archive)")
-      ->type_name("DIRECTORY");
+  offerDirectories(
+      extract
+          .add_option(
+              "--to", request->directory,
+              "The directory to unpack into, created if needed (default: named like the archive)")
+          ->type_name("DIRECTORY"));
   extract.add_flag("--force", request->force, "Replace existing files");
   commands.onRun(
       extract, [request] { return *request; },

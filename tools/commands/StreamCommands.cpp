@@ -7,9 +7,9 @@
 namespace halvox::tools {
 namespace {
 
-void addGlobs(CLI::App& app, const char* name, std::vector<std::string>& patterns,
-              const char* description) {
-  app.add_option(name, patterns, description)->type_name("GLOB")->expected(1)->take_all();
+CLI::Option* addGlobs(CLI::App& app, const char* name, std::vector<std::string>& patterns,
+                      const char* description) {
+  return app.add_option(name, patterns, description)->type_name("GLOB")->expected(1)->take_all();
 }
 
 void addShow(CommandSet& commands, CLI::App& streams, const std::shared_ptr<ShowStreams>& list) {
@@ -48,8 +48,11 @@ void addStreamCommands(CommandSet& commands) {
                   "cut and columns are left out to fit its width; --json has everything.",
        .reach = CommandReach::kFiles});
   streams.require_subcommand(0, 1);
-  addGlobs(streams, "--app", list->applications,
-           "Only streams of applications that match this glob pattern; may be given several times");
+  offerLive(
+      addGlobs(
+          streams, "--app", list->applications,
+          "Only streams of applications that match this glob pattern; may be given several times"),
+      "applications");
   addGlobs(streams, "--device", list->devices,
            "Only streams that used a device whose description or node name matches this glob "
            "pattern; may be given several times");

@@ -16,9 +16,10 @@ void addSummaryCommand(CommandSet& commands) {
   auto* last = addParsed(summary, "--last", request->last, parseCount,
                          "Without a FILE: the newest N (default: 10)");
   last->type_name("N");
-  summary
-      .add_option("FILE", request->files, "Summary files (default: the newest of the service's)")
-      ->excludes(last);
+  offerFiles(summary
+                 .add_option("FILE", request->files,
+                             "Summary files (default: the newest of the service's)")
+                 ->excludes(last));
   commands.onRun(
       summary, [request] { return *request; },
       [](const ShowSummaries& asked, const CommonOptions& options, const ToolStreams& streams) {

@@ -54,15 +54,17 @@ void addTopCommand(CommandSet& commands) {
                   "arrows move through the streams, ? explains all keys and columns. Without a "
                   "terminal it prints one text, or with --json one object, after each interval.",
        .reach = CommandReach::kService});
-  addParsed(top, "--interval", request->interval, parseInterval,
-            "The time between two readings: 2s, 500ms, 1min (default: 2s)")
-      ->type_name("TIME");
+  offerWords(addParsed(top, "--interval", request->interval, parseInterval,
+                       "The time between two readings: 2s, 500ms, 1min (default: 2s)")
+                 ->type_name("TIME"),
+             {"500ms", "1s", "2s", "5s", "10s", "1min"});
   addParsed(top, "--count", request->count, parseCount, "End after N readings")->type_name("N");
   top.add_flag("-b,--batch", request->isBatch,
                "Print texts instead of a screen; also without a terminal");
-  addParsed(top, "--sort", request->sort, parseSortKey,
-            "Sort the streams by xruns, app, device, volume or started (default: xruns)")
-      ->type_name("KEY");
+  offerWords(addParsed(top, "--sort", request->sort, parseSortKey,
+                       "Sort the streams by xruns, app, device, volume or started (default: xruns)")
+                 ->type_name("KEY"),
+             {"xruns", "app", "device", "volume", "started"});
   addDatabase(top, request->database);
   commands.onRun(
       top, [request] { return *request; }, showTop);

@@ -14,11 +14,13 @@ void addRecord(CommandSet& commands, CLI::App& trace) {
       trace, {.name = "record",
               .summary = "Trace while a program runs, then show what was measured",
               .example = "halvoxctl trace record --params params.plist -- pw-play tone.wav"});
-  record.add_option("--params", request->params, "The trace parameters file, a property list")
-      ->type_name("FILE")
-      ->required();
-  record.add_option("COMMAND", request->command, "The program and its arguments, after --")
-      ->required();
+  offerFiles(
+      record.add_option("--params", request->params, "The trace parameters file, a property list")
+          ->type_name("FILE")
+          ->required());
+  offerPrograms(
+      record.add_option("COMMAND", request->command, "The program and its arguments, after --")
+          ->required());
   commands.onRun(
       record, [request] { return *request; },
       [](const RecordTrace& asked, const CommonOptions& options, const ToolStreams& streams) {
@@ -32,7 +34,7 @@ void addShow(CommandSet& commands, CLI::App& trace) {
                                              .summary = "Show statistics of a results file",
                                              .example = "halvoxctl trace show tracing_results.ssj",
                                              .reach = CommandReach::kFiles});
-  show.add_option("FILE", request->file, kFile)->required();
+  offerFiles(show.add_option("FILE", request->file, kFile)->required());
   commands.onRun(
       show, [request] { return *request; },
       [](const ShowTrace& asked, const CommonOptions& options, const ToolStreams& streams) {
@@ -47,8 +49,10 @@ void addExport(CommandSet& commands, CLI::App& trace) {
               .summary = "Write the intervals for trace viewers",
               .example = "halvoxctl trace export tracing_results.ssj --to trace.json",
               .reach = CommandReach::kFiles});
-  exporting.add_option("FILE", request->file, kFile)->required();
-  exporting.add_option("--to", request->to, "The file to write")->type_name("FILE")->required();
+  offerFiles(exporting.add_option("FILE", request->file, kFile)->required());
+  offerFiles(exporting.add_option("--to", request->to, "The file to write")
+                 ->type_name("FILE")
+                 ->required());
   commands.onRun(
       exporting, [request] { return *request; },
       [](const ExportTrace& asked, const CommonOptions& options, const ToolStreams& streams) {
