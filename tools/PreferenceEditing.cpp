@@ -7,7 +7,7 @@
 #include <utility>
 
 #include "platform/linux/base/Utf8.h"
-#include "platform/linux/configuration/TomlNesting.h"
+#include "platform/linux/configuration/TomlTrouble.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "platform/linux/settings/TomlValues.h"
 
@@ -18,7 +18,7 @@ using platform::Dictionary;
 using platform::Value;
 using platform::linux_::appendEscaped;
 using platform::linux_::Failure;
-using platform::linux_::isNestedTooDeep;
+using platform::linux_::findTomlTrouble;
 using platform::linux_::isUtf8;
 using platform::linux_::kLargestPreferenceFile;
 using platform::linux_::nextUtf8;
@@ -99,7 +99,9 @@ bool followsItsKey(const toml::node& node) {
 class ParsedText {
  public:
   ParsedText(std::string_view text, const std::filesystem::path& file)
-      : text_(text), file_(file), parsed_(toml::parse(text)) {}
+      : text_(text),
+        file_(file),
+        parsed_(toml::parse(findTomlTrouble(text).has_value() ? kNotToml : text)) {}
 
   [[nodiscard]] bool isValid() const { return static_cast<bool>(parsed_); }
   [[nodiscard]] const toml::table& root() const { return parsed_.table(); }
@@ -135,6 +137,9 @@ class ParsedText {
   }
 
  private:
+  // Stands for a text that toml++ must not be given.
+  static constexpr std::string_view kNotToml = "=";
+
   std::string_view text_;  // owned by the caller
   const std::filesystem::path& file_;
   toml::parse_result parsed_;
@@ -167,8 +172,7 @@ std::string withNewLine(std::string_view text, std::size_t place, const std::str
 
 Result<PreferenceValue> parsePreferenceValue(std::string_view text, ValueForm form) {
   if (!isUtf8(text)) return Failure<>{"VALUE: expected UTF-8 text, found other bytes"};
-  // The nesting is tested before parsing, because the parser is recursive.
-  if (form == ValueForm::kTomlOrString && !isNestedTooDeep(text)) {
+  if (form == ValueForm::kTomlOrString && !findTomlTrouble(text).has_value()) {
     constexpr std::string_view kKey = "v = ";
     const std::string line = std::string(kKey) + std::string(text);
     const toml::parse_result parsed = toml::parse(line);

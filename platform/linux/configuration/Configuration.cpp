@@ -14,7 +14,7 @@
 #include "platform/linux/base/WholeFile.h"
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/configuration/ConfigurationReader.h"
-#include "platform/linux/configuration/TomlNesting.h"
+#include "platform/linux/configuration/TomlTrouble.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -249,14 +249,9 @@ void readDrivers(TableReader table, Configuration::Drivers& drivers) {
 Result<Configuration, ConfigurationError> parse(const std::string& file, std::string_view text,
                                                 const DefaultPlaces& places) {
   ConfigurationMistakes mistakes(file);
-  // Check before parsing, because the parser limits the depth of brackets, but not the number of
-  // dots in a key. A key of 100,000 words makes 100,000 nested tables, and walking through them
-  // overflows the stack.
-  if (const auto line = lineNestedTooDeep(text)) {
-    mistakes.add(
-        {static_cast<toml::source_index>(*line), 1},
-        fmt::format("the file: expected at most {} levels of tables and arrays, found more",
-                    kDeepestNesting));
+  if (const auto trouble = findTomlTrouble(text)) {
+    mistakes.add({static_cast<toml::source_index>(trouble->line), 1},
+                 "the file: " + trouble->description());
     return *mistakes.first();
   }
   const toml::parse_result parsed = toml::parse(text);

@@ -156,6 +156,14 @@ TEST_F(ConfigurationMistakesTest, SyntaxErrorIsReportedWithItsPlace) {
               StartsWith("2:10: the file: expected TOML, found a mistake: "));
 }
 
+TEST_F(ConfigurationMistakesTest, AHeaderWithoutAKeyIsAMistake) {
+  for (const std::string header : {"[=]", "[\x01]", "[[,]]", "[a.=]"}) {
+    EXPECT_THAT(mistake(header + "\nsocket = 3\n"),
+                AllOf(StartsWith("1:"), HasSubstr("the file: expected TOML, found a mistake: ")))
+        << header;
+  }
+}
+
 TEST_F(ConfigurationMistakesTest, TextThatIsNotUtf8IsAMistake) {
   // The parser reports the place of the last character before the mistake.
   EXPECT_THAT(mistake("[listener]\nsocket = \"/\xFF\"\n"),

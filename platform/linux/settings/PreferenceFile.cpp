@@ -7,7 +7,7 @@
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/Utf8.h"
 #include "platform/linux/base/WholeFile.h"
-#include "platform/linux/configuration/TomlNesting.h"
+#include "platform/linux/configuration/TomlTrouble.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "platform/linux/settings/TomlValues.h"
 
@@ -28,6 +28,10 @@ Failure<> problem(const std::filesystem::path& file, std::string_view what) {
 
 Failure<> problem(const std::filesystem::path& file, int error) {
   return problem(file, ": cannot read the preferences: " + errnoText(error));
+}
+
+Failure<> problem(const std::filesystem::path& file, const TomlTrouble& trouble) {
+  return problem(file, ":" + std::to_string(trouble.line) + ":1: " + trouble.description());
 }
 
 // `size` may be less than the limit if the file grew after its size was read.
@@ -65,16 +69,14 @@ std::optional<std::filesystem::path> preferencePath(const std::filesystem::path&
 
 Result<std::optional<PreferenceText>> readPreferenceText(const std::filesystem::path& file) {
   auto content = readText(file);
-  // Check before parsing, because the parser bounds brackets but not dotted keys, and walking
-  // through the tables of a key of 100,000 words ran out of stack.
-  if (content && content->has_value() && isNestedTooDeep((*content)->text)) {
-    return problem(file, ": expected at most " + std::to_string(kDeepestNesting) +
-                             " levels of tables and arrays, found more");
+  if (content && content->has_value()) {
+    if (const auto trouble = findTomlTrouble((*content)->text)) return problem(file, *trouble);
   }
   return content;
 }
 
 Result<Dictionary> parsePreferences(std::string_view text, const std::filesystem::path& file) {
+  if (const auto trouble = findTomlTrouble(text)) return problem(file, *trouble);
   const toml::parse_result parsed = toml::parse(text);
   if (parsed) return toDictionary(parsed.table());
   const toml::parse_error& error = parsed.error();

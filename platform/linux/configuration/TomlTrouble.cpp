@@ -1,31 +1,49 @@
-#include "platform/linux/configuration/TomlNesting.h"
+#include "platform/linux/configuration/TomlTrouble.h"
 
 #include <algorithm>
 #include <utility>
 #include <vector>
 
+#include <fmt/format.h>
+
 namespace halvox::platform::linux_ {
 namespace {
+
+// Whether TOML has that character only in quotes and comments, or nowhere.
+bool isStrange(char character) {
+  const auto byte = static_cast<unsigned char>(character);
+  const bool isSpace = character == '\t' || character == '\n' || character == '\r';
+  return (byte < 0x20 && !isSpace) || byte >= 0x7F;
+}
 
 // Counts the brackets and dots of a text outside quotes and comments. Does not parse and does not
 // recurse, because the text may be anything.
 class NestingScan {
  public:
-  explicit NestingScan(std::string_view text) : rest_(text) {}
+  explicit NestingScan(std::string_view text) : text_(text), rest_(text) {
+    constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
+    if (rest_.starts_with(kByteOrderMark)) rest_.remove_prefix(kByteOrderMark.size());
+  }
 
-  // Returns the number of bytes up to the place where the nesting becomes too deep; none if it
-  // never does.
-  std::optional<std::size_t> find() {
-    const std::size_t size = rest_.size();
+  std::optional<TomlTrouble> find() {
     while (!rest_.empty()) {
       take(rest_.front());
-      if (depth_ > kDeepestNesting) return size - rest_.size();
+      if (isStrange_) return TomlTrouble{TomlTrouble::Kind::kCharacter, line()};
+      if (depth_ > kDeepestNesting) return TomlTrouble{TomlTrouble::Kind::kTooDeep, line()};
     }
     return std::nullopt;
   }
 
  private:
+  // The number of the line that was read last.
+  [[nodiscard]] std::size_t line() const {
+    const std::string_view read = text_.substr(0, text_.size() - rest_.size());
+    return static_cast<std::size_t>(std::ranges::count(read, '\n')) + 1;
+  }
+
   void take(char character) {
+    isStrange_ = isStrange(character);
+    if (isStrange_) return;
     if (character == '"' || character == '\'') return skipQuoted(character);
     if (character == '#') return skip(rest_.find('\n'));
     rest_.remove_prefix(1);
@@ -94,20 +112,28 @@ class NestingScan {
     for (int extra = 0; isLong && extra < 2 && rest_.starts_with(quote); ++extra) skip(1);
   }
 
+  const std::string_view text_;
   std::string_view rest_;
   std::vector<std::size_t> levels_{0};  // of the current element, for each open bracket
   std::size_t header_ = 0;              // levels of the current table header
   std::size_t depth_ = 0;               // sum of levels_ and header_
   bool isHeader_ = false;
+  bool isStrange_ = false;  // the current character
   bool isLineStart_ = true;
 };
 
 }  // namespace
 
-std::optional<std::size_t> lineNestedTooDeep(std::string_view text) {
-  const auto read = NestingScan(text).find();
-  if (!read.has_value()) return std::nullopt;
-  return static_cast<std::size_t>(std::ranges::count(text.substr(0, *read), '\n')) + 1;
+std::string TomlTrouble::description() const {
+  if (kind == Kind::kCharacter) {
+    return "expected TOML, found a mistake: a control or non-ASCII character outside quotes";
+  }
+  return fmt::format("expected at most {} levels of tables and arrays, found more",
+                     kDeepestNesting);
+}
+
+std::optional<TomlTrouble> findTomlTrouble(std::string_view text) {
+  return NestingScan(text).find();
 }
 
 }  // namespace halvox::platform::linux_
