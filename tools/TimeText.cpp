@@ -197,6 +197,9 @@ double midnight(double now, int daysBefore) {
 
 std::string calendarTime(double seconds, std::tm* (*split)(const std::time_t*, std::tm*),
                          const char* zone) {
+  // A database may hold any number. The year 10000 has no date that people would recognise.
+  constexpr double kEnd = 253'402'300'800;
+  if (!(std::abs(seconds) < kEnd)) return std::to_string(seconds);
   const double whole = std::floor(seconds);
   // Rounded down, because a time that was rounded up would lie after its record, and --since with
   // this time would skip the record.

@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 #include <ctime>
+#include <limits>
 
 #include <gtest/gtest.h>
 
@@ -43,6 +44,13 @@ TEST_F(TimeTextTest, DatesWithoutOffsetAreLocal) {
   setZone("XXX-02");  // two hours east
 
   EXPECT_EQ(valueOf(parseTime("1970-01-02T02:00:00", kNow)), 86'400.0);
+}
+
+TEST_F(TimeTextTest, ATimeThatIsTooFarOffIsPrintedAsANumber) {
+  EXPECT_EQ(utcClockTime(1e19), "10000000000000000000.000000");
+  EXPECT_EQ(utcClockTime(-1e19), "-10000000000000000000.000000");
+  EXPECT_EQ(utcClockTime(std::numeric_limits<double>::infinity()), "inf");
+  EXPECT_EQ(utcClockTime(253'402'300'799), "9999-12-31 23:59:59.000Z");
 }
 
 TEST_F(TimeTextTest, WrongTimesAreRefused) {
