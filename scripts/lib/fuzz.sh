@@ -13,6 +13,9 @@ each=$((seconds / ${#targets[@]}))
 scratch=$(mktemp -d)
 trap 'rm -rf "$scratch"' EXIT
 
+# How many edges of the control flow the inputs reached.
+covered() { sed -n 's/.* cov: \([0-9]*\).*/\1/p' "$1" | tail -n 1; }
+
 run_target() {
   local target=$1 found=$scratch/$1
   mkdir "$found"
@@ -21,8 +24,9 @@ run_target() {
     tail -n 60 "$found.log"
     return 1
   fi
-  echo "fuzz: $target: $(grep -E '^Done' "$found.log")"
+  echo "fuzz: $target: $(grep -E '^Done' "$found.log"), $(covered "$found.log") edges of $(
+    sed -n 's/.* modules\? *(\([0-9]*\) inline.*/\1/p' "$found.log" | head -n 1)"
 }
-export -f run_target
+export -f covered run_target
 export bin each scratch
 printf '%s\0' "${targets[@]}" | xargs -0 -n 1 -P 2 bash -c 'run_target "$1"' _
