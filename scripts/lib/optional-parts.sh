@@ -16,6 +16,7 @@ declare -A options=(
   [nats]="-DHALVOX_NATS=OFF"
   [report]="-DHALVOX_REPORT=OFF"
   [screen]="-DHALVOX_SCREEN=OFF"
+  [man]="-DHALVOX_MAN=OFF"
 )
 options[all]="${options[*]}"
 
@@ -43,7 +44,7 @@ case "${1:-}" in
     check all halvox-reportingd halvox-sqlite halvoxctl
     ;;
   "")
-    for part in alsa pipewire trace-points tracing nats report screen all; do
+    for part in alsa pipewire trace-points tracing nats report screen man all; do
       check "$part" all
       test_units "$part"
     done
