@@ -75,6 +75,42 @@ class Durability(unittest.TestCase):
         self.assertEqual([(payload["run"], payload["number"]) for payload in payloads],
                          [(run, number) for run in range(2) for number in range(100)])
 
+    def reported_ends(self, service):
+        """The events about how earlier runs ended, as `halvoxctl events` shows them."""
+        shown = service.ctl("events", "--name", "com.tarno.reporting.lastrun", "--json").stdout
+        return [json.loads(line)["payload"] for line in shown.splitlines()]
+
+    def test_a_clean_stop_a_crash_and_a_power_cut_are_told_apart_at_the_next_start(self):
+        service = Service()
+        self.addCleanup(shutil.rmtree, service.directory, True)
+        self.addCleanup(service.stop)
+        service.start()
+        self.assertEqual(service.stop(), 0)
+        for run in (2, 3):
+            service.start()
+            wait_for("the new run in the store",
+                     lambda run=run: len(self.runs(service)) == run)
+            service.process.send_signal(signal.SIGKILL)
+            service.process.wait(harness.DEADLINE)
+        # As if the system had restarted after the last kill.
+        with contextlib.closing(sqlite3.connect(service.database)) as database, database:
+            database.execute("UPDATE run_records SET boot_id = 'an earlier one' WHERE ending IS NULL")
+        service.start()
+        wait_for("the second report", lambda: len(self.reported_ends(service)) == 2)
+        ends = self.reported_ends(service)
+
+        self.assertEqual([(end["run"], end["end"], end.get("missing_seconds")) for end in ends],
+                         [(2, "crash", 0.5), (3, "power cut", None)])
+        runs = self.runs(service)
+        self.assertEqual([ending for *_, ending in runs], ["clean", "crash", "power cut", None])
+        self.assertEqual([(end["start"], end["last_commit"]) for end in ends],
+                         [(start, commit) for start, commit, _ in runs[1:3]])
+        self.assertIn("the last run did not close the store (power cut)", service.log())
+
+    def runs(self, service):
+        with connect_to_store(service.database) as database:
+            return database.execute("SELECT start, last_commit, ending FROM runs").fetchall()
+
     def fill(self, service, megabytes):
         """Puts events of earlier runs into the database of a service that does not run."""
         payload = json.dumps({"text": "x" * 8000})

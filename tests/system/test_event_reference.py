@@ -36,6 +36,9 @@ class EventReferenceTest(unittest.TestCase):
         for domain, key in (("com.tarno.halvox", "device_name"),
                             ("com.tarno.pavisk", "spatial-audio-accessory-feature")):
             self.ctl("preferences", "set", domain, key, "Kitchen")
+        # The second run reports that the first one was killed.
+        stop_process(self.service.process, signal.SIGKILL)
+        self.service.start()
 
     def ctl(self, *arguments):
         return self.service.ctl(*arguments).stdout
@@ -106,6 +109,7 @@ class EventReferenceTest(unittest.TestCase):
 
     def test_everything_that_is_recorded_is_described(self):
         reference = EventReference()
+        self.wait_for_events("com.tarno.reporting.lastrun")
         self.run_haptics()
         self.run_streams()
 

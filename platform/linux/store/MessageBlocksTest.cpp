@@ -321,7 +321,8 @@ void makeVersion2(const std::filesystem::path& database) {
           "DROP VIEW analytics_events; DROP VIEW link_messages;"
           "CREATE VIEW analytics_events AS SELECT 1; CREATE VIEW link_messages AS SELECT 1;"
           "DROP TABLE message_blocks; DROP TABLE message_spans; DROP VIEW losses;"
-          "DROP TABLE loss_records; DROP TABLE loss_spans; PRAGMA user_version = 2");
+          "DROP TABLE loss_records; DROP TABLE loss_spans; DROP VIEW runs; DROP TABLE run_records;"
+          "PRAGMA user_version = 2");
 }
 
 TEST_F(MessageBlocksTest, RecordsOfTheVersionBeforeComeFirst) {

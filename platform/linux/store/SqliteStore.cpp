@@ -34,6 +34,14 @@ DropReason reasonOf(SqliteCode code, int systemError) {
   return DropReason::kInputOutput;
 }
 
+enum class Sync : std::uint8_t { kEach, kCheckpoints };
+
+// Sets which commits wait for the disk: each, or only those that copy the log into the database.
+SqliteCode syncCommits(Database& database, Sync sync) {
+  return database.execute(sync == Sync::kEach ? "PRAGMA synchronous = FULL"
+                                              : "PRAGMA synchronous = NORMAL");
+}
+
 // Disables SQLite's count of the memory that it uses. Counting takes a lock at each allocation, and
 // nothing reads the count. SQLite accepts this setting only before its first use in the process.
 void configureLibrary() {
@@ -60,11 +68,15 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
       losses_(environment.statistics, environment.clock),
       retention_({.age = std::chrono::days(options.retentionDays),
                   .databaseBytes = sizes_.databaseBytes,
-                  .transactionBytes = sizes_.transactionBytes}) {}
+                  .transactionBytes = sizes_.transactionBytes}),
+      runs_(environment.clock, options.bootID) {}
 
 Result<void, StoreError> SqliteStore::open() {
   configureLibrary();
   if (auto opened = openDatabase(); !opened) return opened;
+  reportLastRun();
+  // The writer notes this run even if no record comes.
+  queue_.requestRound();
   writer_ = std::thread([this] { run(); });
   return {};
 }
@@ -76,12 +88,12 @@ void SqliteStore::close() {
 
 void SqliteStore::run() {
   setUpThread("halvox-store");
-  // Run retention at the start. Records may have expired since the last run, and the next record,
-  // after which retention runs, may come only much later.
-  maintainWhileIdle();
   const auto takeAll = [this] {
     for (RecordKind* const kind : kinds_) kind->takeQueued();
   };
+  // open() has requested the first round, in which nothing may be queued. It notes this run, and
+  // runs retention: records may have expired since the last run, and the next record may come only
+  // much later.
   while (queue_.take(nextRound_, takeAll)) {
     nextRound_ = std::chrono::steady_clock::now() + queue_.limits().gatherTime;
     // Replace a damaged database before writing. The records then go into the new database.
@@ -90,8 +102,19 @@ void SqliteStore::run() {
     maintainWhileIdle();
     releaseMemoryIfIdle();
   }
-  writeLastLosses();
+  writeEnd();
   closeDatabase();
+}
+
+// Records that the last run did not close the store. The event is in the transaction that notes
+// this run. A clean end makes no event, because nothing is missing; the view `runs` has it.
+void SqliteStore::reportLastRun() {
+  const std::optional<LastRun>& last = runs_.last();
+  if (!last.has_value() || last->ending == RunEnding::kClean) return;
+  kLog.notice("the last run did not close the store (", endingName(last->ending),
+              "); what it received just before its end may be missing");
+  messages_.addEvent(clock_.currentDate().secondsSince1970, kLastRunEvent,
+                     [run = *last] { return lastRunPayload(run); });
 }
 
 void SqliteStore::writeTaken() {
@@ -107,14 +130,19 @@ void SqliteStore::writeTaken() {
 }
 
 bool SqliteStore::hasTaken() const {
-  return std::ranges::any_of(kinds_, [](const RecordKind* kind) { return kind->hasTaken(); });
+  return runs_.mustWrite() ||
+         std::ranges::any_of(kinds_, [](const RecordKind* kind) { return kind->hasTaken(); });
 }
 
-// While records are dropped, the attempt would fail again and log the failure once more.
-void SqliteStore::writeLastLosses() {
-  if (droppedSinceStored_ > 0) return;
-  losses_.finish();
-  writeTaken();
+// Writes the last losses and the end of this run.
+void SqliteStore::writeEnd() {
+  runs_.finish();
+  if (droppedSinceStored_ == 0) {
+    losses_.finish();
+    return writeTaken();
+  }
+  // While records are dropped, this attempt will probably fail too. The failure has been logged.
+  if (database_.isOpen() && writeTransaction() == SQLITE_OK) onStored();
 }
 
 // Opens the database if it is not open. Also opens it again if its path now leads to another file
@@ -227,6 +255,7 @@ SqliteCode SqliteStore::prepareStatements() {
   SqliteCode code = database_.prepare("BEGIN IMMEDIATE", begin_);
   if (code == SQLITE_OK) code = database_.prepare("COMMIT", commit_);
   if (code == SQLITE_OK) code = retention_.prepare(database_);
+  if (code == SQLITE_OK) code = runs_.prepare(database_);
   for (RecordKind* const kind : kinds_) {
     if (code == SQLITE_OK) code = kind->prepare(database_);
   }
@@ -238,15 +267,20 @@ SqliteCode SqliteStore::writeTransaction() {
                                  static_cast<std::int64_t>(sizes_.transactionBytes)};
   // Set errno to 0, because fail() reads it if SQLite itself does not report the system's error.
   errno = 0;
-  SqliteCode code = begin_.run();
+  const bool isFirst = !runs_.isNoted();
+  SqliteCode code = isFirst ? syncCommits(database_, Sync::kEach) : SQLITE_OK;
+  if (code == SQLITE_OK) code = begin_.run();
   for (RecordKind* const kind : kinds_) {
     if (code == SQLITE_OK) code = kind->write(allowance);
   }
+  if (code == SQLITE_OK) code = runs_.write();
   if (code == SQLITE_OK) code = commit_.run();
+  if (isFirst) static_cast<void>(syncCommits(database_, Sync::kCheckpoints));
   return code;
 }
 
 void SqliteStore::onStored() {
+  runs_.onCommitted();
   FinishedRecords finished;
   for (RecordKind* const kind : kinds_) kind->onCommitted(finished);
   queue_.finish(finished.written, finished.writtenBytes);
@@ -341,6 +375,7 @@ void SqliteStore::releaseStatements() {
   begin_ = {};
   commit_ = {};
   retention_.release();
+  runs_.release();
   for (RecordKind* const kind : kinds_) kind->release();
 }
 

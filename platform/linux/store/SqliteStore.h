@@ -17,6 +17,7 @@
 #include "platform/linux/store/MessageRecords.h"
 #include "platform/linux/store/OldRecords.h"
 #include "platform/linux/store/Retention.h"
+#include "platform/linux/store/ServiceRuns.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreCheck.h"
 #include "platform/linux/store/StoreError.h"
@@ -35,6 +36,7 @@ struct StoreOptions {
   std::uint32_t maxMegabytes = defaults::kStorageMegabytes;        // database and log together
   std::vector<std::string> wantedEvents{defaults::kWantedEvents};  // patterns for fnmatch(3)
   QueueLimits queue{};
+  std::string bootID = currentBootID();
 };
 
 // The SQLite database halvox.db and the one thread that writes to it.
@@ -54,6 +56,10 @@ struct StoreOptions {
 // one. If the database is damaged, the store renames it, starts a new one, and copies the records
 // of this run into that. StoreCheck checks a database that the last run did not close, in the
 // background.
+//
+// The first transaction of a run notes in the database that the run has begun, the last one that it
+// has ended. If the run before did not end in this way, the event `com.tarno.reporting.lastrun`
+// says what may be missing.
 //
 // Owned by the platform. open() and close() belong to one thread.
 class SqliteStore {
@@ -95,7 +101,8 @@ class SqliteStore {
 
   void run();
   void writeTaken();
-  void writeLastLosses();
+  void writeEnd();
+  void reportLastRun();
   [[nodiscard]] bool hasTaken() const;
   [[nodiscard]] bool makeReady();
   [[nodiscard]] bool logHasRoom();
@@ -138,6 +145,7 @@ class SqliteStore {
   Statement begin_;
   Statement commit_;
   Retention retention_;
+  ServiceRuns runs_;
   Time nextRound_{};
   std::uint64_t droppedSinceStored_ = 0;
   std::uint64_t bytesSinceRelease_ = 0;  // of payloads, since memory was last released

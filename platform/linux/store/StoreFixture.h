@@ -47,8 +47,10 @@ class StoreFixture : public ::testing::Test {
   void send(std::int64_t number, const std::string& name = "com.tarno.test");
   [[nodiscard]] bool allIsStored();
   [[nodiscard]] std::filesystem::path database() const { return options.directory / "halvox.db"; }
+  // The payloads of the events that tests send, without those of the store itself.
   [[nodiscard]] std::vector<std::string> payloads() const {
-    return rows(database(), "SELECT payload FROM analytics_events");
+    return rows(database(), "SELECT payload FROM analytics_events WHERE name != '" +
+                                std::string(kLastRunEvent) + "'");
   }
   [[nodiscard]] std::vector<std::filesystem::path> setAsideFiles() const;
   [[nodiscard]] std::uint64_t counted(std::string_view name) const {

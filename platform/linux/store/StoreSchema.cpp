@@ -169,9 +169,21 @@ CREATE VIEW losses(time, piece, reason, count) AS
 SELECT time, piece, reason, count FROM loss_records;
 )sql";
 
+// The runs of the service (ServiceRuns.h). `ending` is NULL while a run lasts.
+constexpr std::string_view kRuns = R"sql(
+CREATE TABLE run_records(
+  id INTEGER PRIMARY KEY,
+  boot_id TEXT NOT NULL,
+  start_time REAL NOT NULL,
+  last_commit REAL NOT NULL,
+  ending TEXT);
+CREATE VIEW runs(run, start, last_commit, ending) AS
+SELECT id, start_time, last_commit, ending FROM run_records;
+)sql";
+
 // Step n migrates from version n to version n + 1. Never change a step that was released, because
 // stores that have already applied it would differ from new ones.
-constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks, kLosses};
+constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks, kLosses, kRuns};
 
 }  // namespace
 
