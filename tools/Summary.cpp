@@ -18,10 +18,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// Relative, because it is below the storage root of the service.
-constexpr const char* kDirectory =
-    "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
-
 using Row = std::array<std::string, 6>;
 
 struct Session {
@@ -152,7 +148,7 @@ ExitStatus showNewest(std::uint64_t count, OutputForm form, std::ostream& out,
   const auto configuration = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   const fs::path directory =
-      std::get<platform::linux_::Configuration>(configuration).storage.root / kDirectory;
+      std::get<platform::linux_::Configuration>(configuration).storage.root / kSummaryDirectory;
   std::error_code error;
   const auto files = newestIn(directory, count, error);
   if (error || (files.empty() && count > 0)) {

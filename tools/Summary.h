@@ -9,6 +9,10 @@
 
 namespace halvox::tools {
 
+// Where the service writes summary files. Relative, because it is below the service's storage root.
+inline constexpr const char* kSummaryDirectory =
+    "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
+
 // A request for summaries of sessions, which internal builds of the service write.
 struct ShowSummaries {
   std::vector<std::string> files{};  // empty: the newest ones of the service

@@ -20,6 +20,7 @@ void addStreamCommands(CommandSet& commands);    // streams
 void addReportCommand(CommandSet& commands);     // report
 void addSnapshotCommands(CommandSet& commands);  // snapshots
 void addSummaryCommand(CommandSet& commands);    // summary
+void addVerifyCommand(CommandSet& commands);     // verify
 void addTraceCommands(CommandSet& commands);     // trace
 void addDriverCommand(CommandSet& commands);     // drivers
 void addSettingsCommands(CommandSet& commands);  // preferences, notify

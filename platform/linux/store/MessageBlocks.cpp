@@ -8,10 +8,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Open rows become a sealed block when they have this many records, which are 85 messages with two
-// events and a link message each. Fewer would cost space: messages take twice as many bytes in
-// blocks of 32 messages as in blocks of 340.
-constexpr std::uint64_t kRecordsToSeal = 256;
 // An open row with fewer records is not compressed, because it fits into the page that its commit
 // writes in any case.
 constexpr std::uint64_t kRecordsToCompress = 24;

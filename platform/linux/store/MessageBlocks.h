@@ -30,6 +30,11 @@ namespace halvox::platform::linux_ {
 //   begin(); addEvent(), addLink() ...; end(); then onCommitted() or onRolledBack()
 class MessageBlocks {
  public:
+  // Open rows become a sealed block when they have this many records, which are 85 messages with
+  // two events and a link message each. Fewer would cost space: messages take twice as many bytes
+  // in blocks of 32 messages as in blocks of 340.
+  static constexpr std::uint64_t kRecordsToSeal = 256;
+
   // Prepares the statements, after each opening of the database.
   [[nodiscard]] SqliteCode prepare(Database& database);
   // Finalizes all statements, before each closing of the database.

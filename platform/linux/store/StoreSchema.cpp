@@ -189,9 +189,12 @@ constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks
 
 const std::int64_t kStoreSchemaVersion = kMigrations.size();
 
-SqliteCode migrate(Database& database) {
+SqliteCode migrate(Database& database) { return migrateTo(database, kStoreSchemaVersion); }
+
+SqliteCode migrateTo(Database& database, std::int64_t version) {
   const std::int64_t present = database.queryInteger("PRAGMA user_version").value_or(0);
-  for (auto step = static_cast<std::size_t>(present); step < kMigrations.size(); ++step) {
+  for (auto step = static_cast<std::size_t>(present); step < static_cast<std::size_t>(version);
+       ++step) {
     // Change the version in the transaction of its step. No step can then be applied twice or in
     // part.
     const SqliteCode code =

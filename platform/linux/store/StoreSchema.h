@@ -24,5 +24,7 @@ constexpr std::int64_t kBlocksSinceVersion = 3;
 // next call continues with the failed step. The database must not be newer than
 // kStoreSchemaVersion.
 [[nodiscard]] SqliteCode migrate(Database& database);
+// The same up to `version`, for comparing a database with an empty one of its version.
+[[nodiscard]] SqliteCode migrateTo(Database& database, std::int64_t version);
 
 }  // namespace halvox::platform::linux_
