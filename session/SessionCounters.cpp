@@ -35,14 +35,16 @@ SessionCounters::Link linkOf(const Piece& piece) {
           .redundant = piece["suppressed: redundant"],
           .notAllowed = piece["dropped: transactions not allowed"],
           .testSession = piece["dropped: test session"],
-          .noBackend = piece["dropped: no back-end"]};
+          .noBackend = piece["dropped: no back-end"],
+          .failureLog = std::make_shared<FailureLog>()};
 }
 
 SessionCounters::SingleMessages singleMessagesOf(const Piece& piece) {
   return {.received = piece["received"],
           .sent = piece["sent"],
           .failed = piece["failed"],
-          .sampled = piece["suppressed: sampled"]};
+          .sampled = piece["suppressed: sampled"],
+          .failureLog = std::make_shared<FailureLog>()};
 }
 
 }  // namespace

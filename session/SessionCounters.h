@@ -3,6 +3,7 @@
 #include <memory>
 
 #include "platform/statistics.h"
+#include "session/FailureLog.h"
 
 namespace halvox {
 
@@ -37,6 +38,7 @@ struct SessionCounters {
     platform::Counter& notAllowed;
     platform::Counter& testSession;
     platform::Counter& noBackend;
+    std::shared_ptr<FailureLog> failureLog;
   };
   // received = sent + failed + sampled + the messages whose delay of one second has not passed.
   struct SingleMessages {
@@ -44,6 +46,7 @@ struct SessionCounters {
     platform::Counter& sent;
     platform::Counter& failed;
     platform::Counter& sampled;
+    std::shared_ptr<FailureLog> failureLog;
   };
 
   Messages messages;

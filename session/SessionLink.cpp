@@ -248,8 +248,9 @@ void SessionLink::sendContent(const platform::TLMReportingService::Session& open
   }
   counters_.link.failed.add();
   // A failure without an error is only counted; this is required.
-  if (outcome.error.has_value()) {
-    kSessionLog.error("error sending message ", outcome.error->description);
+  if (!outcome.error.has_value()) return;
+  if (const auto more = counters_.link.failureLog->note()) {
+    kSessionLog.error("error sending message ", outcome.error->description, *more);
   }
 }
 

@@ -159,6 +159,18 @@ TEST_F(SessionLinkMessagesTest, AFailureWithAnErrorIsLoggedAndNotRetried) {
   EXPECT_EQ(framework_.messages().size(), 1U);
 }
 
+TEST_F(SessionLinkMessagesTest, ABurstOfFailuresGetsOneLineAndIsCounted) {
+  open();
+  framework_.setOutcome({.sent = false, .error = platform::Error{.description = "no route"}});
+  platform_.log.clear();
+
+  for (int number = 0; number < 100; ++number) send({{"a", number}});
+  run();
+
+  EXPECT_THAT(platform_.log.texts(LogLevel::kError), ElementsAre("error sending message no route"));
+  EXPECT_EQ(platform_.statistics.value("link", "failed"), 100U);
+}
+
 TEST_F(SessionLinkMessagesTest, AFailureWithoutAnErrorIsSilent) {
   open();
   framework_.setOutcome({.sent = false});

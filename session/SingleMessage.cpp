@@ -63,8 +63,9 @@ std::optional<platform::Error> handOver(const SingleMessage& single,
     return std::nullopt;
   }
   counters.failed.add();
-  if (outcome.error.has_value()) {
-    kSessionLog.error("sendOneMessageWithSessionInfo ", outcome.error->description);
+  if (!outcome.error.has_value()) return std::nullopt;
+  if (const auto more = counters.failureLog->note()) {
+    kSessionLog.error("sendOneMessageWithSessionInfo ", outcome.error->description, *more);
   }
   return std::move(outcome.error);
 }

@@ -184,6 +184,21 @@ TEST_F(SingleMessageTest, AFailureWithAnErrorIsLoggedAndReplied) {
   EXPECT_THAT(replies, ElementsAre(error));
 }
 
+TEST_F(SingleMessageTest, ABurstOfFailuresGetsOneLineAndEachItsReply) {
+  const platform::Error error{.domain = "link", .code = 3, .description = "no route"};
+  platform_.tlmReporting.setOutcome({.sent = false, .error = error});
+  std::vector<std::optional<platform::Error>> replies;
+
+  for (int number = 0; number < 3; ++number) {
+    send(AudioServiceType::kHaptics, {}, [&](const auto& given) { replies.push_back(given); });
+  }
+  platform_.dispatch.advance(1s);
+
+  EXPECT_THAT(platform_.log.texts(LogLevel::kError),
+              ElementsAre("sendOneMessageWithSessionInfo no route"));
+  EXPECT_THAT(replies, ElementsAre(error, error, error));
+}
+
 TEST_F(SingleMessageTest, AFailureWithoutAnErrorIsSilentAndRepliedWithNone) {
   platform_.tlmReporting.setOutcome({.sent = false});
   std::vector<std::optional<platform::Error>> replies;

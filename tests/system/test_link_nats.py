@@ -1,5 +1,6 @@
 """The back-end of the real-time link with real NATS servers, read back by a plain subscriber."""
 
+import re
 import subprocess
 import tempfile
 import time
@@ -12,6 +13,7 @@ from nats import (DRIVER, LONG_DEADLINE, TLS_GREETING, Driver, Operator, Server,
 
 SUBJECT = "halvox.playback_session"
 APIUSAGE = 12  # the service type of that name
+REFUSED = 500  # messages, more than the seconds that a test takes
 EX_CONFIG = 78
 # Limits in seconds for a back-end on an idle machine, and the allowance for a busy one. Each limit
 # is far from the values that it must be distinguished from: messages are given up after 30 s, a
@@ -421,6 +423,26 @@ class ServiceTest(NatsTest):
 
             self.assertGreaterEqual(len(recorded), 10)
             self.assertIn("no backends found, this session won't get sent to the server", service.log())
+
+    def test_refused_messages_have_at_most_one_line_a_second(self):
+        with Server(extra="max_payload: 4096\n") as server, self.service(server.url) as service:
+            client = service.client()
+            client.create(7)
+            client.start_later(7)
+            wait_for("the link", lambda: "continuing with backends!" in service.log())
+            begun = time.monotonic()
+            for number in range(REFUSED):
+                client.send({"number": number, "text": "x" * 6000}, reporters=[7])
+            self.assertIs(client.stop(7), True)
+            wait_for("the end of the link", lambda: "flushed halvox." in service.log())
+            seconds = time.monotonic() - begun
+            self.assertEqual(service.stop(), 0)
+
+            lines = service.log().count("error sending message")
+            self.assertGreaterEqual(lines, 1)
+            self.assertLessEqual(lines, 1 + seconds)
+            failed = re.findall(r"counted link, failed: (\d+)$", service.log(), re.MULTILINE)
+            self.assertGreaterEqual(int(failed[-1]), REFUSED)
 
     def test_the_service_ends_without_waiting_for_a_silent_server(self):
         with SilentServer() as silent, self.service(silent.url) as service:
