@@ -211,7 +211,8 @@ std::string linkWhy(const MessageFate& fate) {
     case LinkFate::kSession:
       return "Session " + std::to_string(fate.session.value_or(0)) + " sent it through its link.";
     case LinkFate::kRepeats:
-      return "Session " + std::to_string(fate.session.value_or(0)) +
+      return (fate.session ? "Session " + std::to_string(*fate.session)
+                           : std::string("One of several sessions")) +
              " dropped it: it repeats record " + std::to_string(fate.previous) + ".";
     case LinkFate::kEqualsEvent:
       return "It equals record " + std::to_string(fate.previous) +

@@ -132,6 +132,10 @@ std::vector<std::string> repetitionSentences(const MessageFate& fate) {
   if (fate.session && *fate.session != -1) {
     sentences.push_back("Session " + std::to_string(*fate.session) +
                         (fate.link == LinkFate::kSession ? " recorded it." : " dropped it."));
+  } else if (fate.link == LinkFate::kRepeats) {
+    sentences.emplace_back(
+        "Several sessions recorded an equal message. The store does not show which of them dropped "
+        "this one.");
   }
   if (fate.isExempt) {
     sentences.emplace_back(
@@ -145,6 +149,13 @@ std::vector<std::string> repetitionSentences(const MessageFate& fate) {
         "before it, apart from hvreporting_timestamp, systemuptime_sec and "
         "processuptime_ms. Sessions drop such a message, however long ago the other "
         "one came. Its events are recorded all the same.");
+  } else if (fate.equalsPrevious) {
+    sentences.push_back("It equals record " + std::to_string(fate.previous) +
+                        ", the message of the same category, type, application and service type "
+                        "before it, but the session did not drop it. The store does not show why: "
+                        "a message between the two may be missing, or the session began again and "
+                        "has no summary of its run before, for example because the service was "
+                        "killed.");
   } else if (fate.previous != 0) {
     sentences.push_back("It differs from record " + std::to_string(fate.previous) +
                         ", the message of the same category, type, application and service type "

@@ -130,7 +130,8 @@ Explainer::Outcome Explainer::explainRecord(std::int64_t id, const Found::Target
                                    .link = one.link,
                                    .session = one.session,
                                    .previous = one.previous,
-                                   .isExempt = one.isExempt});
+                                   .isExempt = one.isExempt,
+                                   .equalsPrevious = one.equalsPrevious});
         }
       },
       [&](const Record& record) { related.see(record); });

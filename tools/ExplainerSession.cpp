@@ -60,8 +60,8 @@ Explainer::Outcome Explainer::explainSession(std::int64_t id, const std::string&
              [&](const MessageFate& fate) {
                if (fate.session == id) {
                  session.add(fate);
-               } else if ((fate.link == LinkFate::kNotRecognised ||
-                           fate.link == LinkFate::kWithoutStamp) &&
+               } else if (!fate.session && !fate.message.isLinkMessage &&
+                          fate.link != LinkFate::kTestSession &&
                           fate.message.service == session.service &&
                           session.applications.contains(fate.message.application)) {
                  ++session.unattributed;
@@ -90,8 +90,7 @@ Explainer::Outcome Explainer::explainSession(std::int64_t id, const std::string&
     explanation.unknown.push_back("Of its application and service type, " +
                                   counted(session.unattributed, "further message") +
                                   " cannot be attributed to a session: no link message names it, "
-                                  "and none of them repeats what "
-                                  "this session recorded.");
+                                  "and none of them repeats what this session alone recorded.");
   }
   explanation.sinks =
       sinksOf(session.all, {.category = {}, .type = {}, .service = session.service}, settings_);

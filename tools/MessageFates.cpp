@@ -82,7 +82,12 @@ void MessageFates::decide(const Message& message, const Dictionary& content, con
   fate.isExempt = !SessionHistory::isRedundant(&content, category, type, content);
   if (message.isLinkMessage) {
     const auto previous = std::ranges::find(base, message.sessionID, &Kept::session);
-    if (previous != base.end()) fate.previous = previous->id;
+    if (previous == base.end()) return;
+    fate.previous = previous->id;
+    // The session would have dropped it. Between the two, its history was emptied or had another
+    // message, and the store does not show that: the service was killed, for example.
+    fate.equalsPrevious =
+        SessionHistory::isRedundant(&previous->message, category, type, content);
     return;
   }
   if (content.find(kStampKey) == nullptr) {
@@ -92,10 +97,14 @@ void MessageFates::decide(const Message& message, const Dictionary& content, con
   for (auto kept = base.rbegin(); kept != base.rend(); ++kept) {
     if (fate.previous == 0) fate.previous = kept->id;
     if (!SessionHistory::isRedundant(&kept->message, category, type, content)) continue;
+    if (fate.link == LinkFate::kRepeats) {
+      if (kept->session) fate.session.reset();
+      continue;
+    }
     fate.previous = kept->id;
     fate.session = kept->session;
     fate.link = kept->session ? LinkFate::kRepeats : LinkFate::kEqualsEvent;
-    break;
+    if (fate.link == LinkFate::kEqualsEvent) break;
   }
   // Whether it was dropped as a repetition does not matter then.
   if (message.service == kTestService) fate.link = LinkFate::kTestSession;

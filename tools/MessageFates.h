@@ -29,11 +29,14 @@ enum class LinkFate : std::uint8_t {
 struct MessageFate {
   const analysis::Message& message;  // valid during the callback only
   LinkFate link = LinkFate::kNotRecognised;
-  std::optional<std::int64_t> session{};  // that took it, or that recorded the one that it repeats
+  // That took it, or that recorded the one that it repeats. Empty if the store does not show it: of
+  // a repetition, if several sessions recorded an equal message.
+  std::optional<std::int64_t> session{};
   // The message of the same category, type, application and service type with which it was
   // compared; 0 if there is none.
   std::int64_t previous = 0;
-  bool isExempt = false;  // errors are never dropped as repetitions
+  bool isExempt = false;        // errors are never dropped as repetitions
+  bool equalsPrevious = false;  // although a session recorded it
 };
 
 // Decides what became of stored messages, with the session's own comparison. A session's history is

@@ -50,11 +50,13 @@ class MessageFatesTest : public testing::Test {
   std::optional<std::int64_t> session_;
   std::int64_t previous_ = 0;
   bool isExempt_ = false;
+  bool equalsPrevious_ = false;
   MessageFates fates_{[this](const MessageFate& fate) {
     last_ = fate.link;
     session_ = fate.session;
     previous_ = fate.previous;
     isExempt_ = fate.isExempt;
+    equalsPrevious_ = fate.equalsPrevious;
   }};
 };
 
@@ -87,6 +89,25 @@ TEST_F(MessageFatesTest, EachSessionHasItsOwnNewestMessage) {
 
   EXPECT_EQ(fateOf(event(R"("n":1)")), LinkFate::kRepeats);
   EXPECT_EQ(session_, 7);
+}
+
+TEST_F(MessageFatesTest, WhichOfTwoSessionsDroppedARepetitionIsNotKnown) {
+  fateOf(linked(R"("n":1)", 7));
+  fateOf(linked(R"("n":1)", 8));
+
+  EXPECT_EQ(fateOf(event(R"("n":1)")), LinkFate::kRepeats);
+  EXPECT_EQ(session_, std::nullopt);
+  EXPECT_EQ(previous_, 2);
+}
+
+TEST_F(MessageFatesTest, AnEqualMessageThatASessionRecordedNeverthelessIsNotSaidToDiffer) {
+  fateOf(linked(R"("n":1)"));
+  fateOf(linked(R"("n":1)"));  // the service was killed between the two
+  EXPECT_TRUE(equalsPrevious_);
+  EXPECT_EQ(previous_, 1);
+
+  fateOf(linked(R"("n":2)"));
+  EXPECT_FALSE(equalsPrevious_);
 }
 
 TEST_F(MessageFatesTest, ASummaryEndsTheComparisonWithItsSession) {

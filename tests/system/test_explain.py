@@ -1,6 +1,7 @@
 """Why messages are where they are."""
 
 import json
+import signal
 import unittest
 
 from harness import start_service, wait_for
@@ -71,6 +72,45 @@ class ExplainTest(Explaining):
         self.assertRegex(link["why"], r"Session 7 dropped it: it repeats record \d+\.")
         self.assertEqual(sinks["events, name of all services"]["took"], "yes")
         self.assertEqual(sinks["summary of the session"]["took"], "no")
+
+    def sentences(self, record):
+        found = [one for one in self.explain(record) if one["explains"] == "record"]
+        return " ".join(found[0]["sessions"])
+
+    def test_no_session_is_named_if_several_may_have_dropped_a_message(self):
+        for session in (7, 8):
+            self.session(session)
+            self.client.send({"n": 1}, SESSION_PLAYBACK, START, [session])
+            self.wait_for_link(session, 1)
+        self.client.send({"n": 1}, SESSION_PLAYBACK, START, [7])
+        self.service.wait_for_events(6)
+        newest = self.record("Session_Playback.Start", "events, name of all services")
+
+        sentences = self.sentences(newest)
+        self.assertIn("The store does not show which of them dropped this one.", sentences)
+        self.assertNotRegex(sentences, "Session [78] dropped")
+        for session in (7, 8):
+            found = [one for one in self.explain(session) if one["explains"] == "session"][0]
+            self.assertIn("1 further message cannot be attributed", " ".join(found["unknown"]))
+
+    def test_a_message_after_the_service_was_killed_is_not_said_to_differ(self):
+        self.session(7)
+        self.client.send({"n": 1}, SESSION_PLAYBACK, START, [7])
+        self.wait_for_link(7, 1)
+        first = self.record("Session_Playback.Start", "link, in a session")
+        self.service.stop(signal.SIGKILL)
+        self.service.start()
+        self.client = self.service.client()
+        self.addCleanup(self.client.close)
+        self.session(7)
+        self.client.send({"n": 1}, SESSION_PLAYBACK, START, [7])
+        self.wait_for_link(7, 2)
+        newest = self.record("Session_Playback.Start", "link, in a session")
+
+        self.assertNotEqual(newest, first)
+        sentences = self.sentences(newest)
+        self.assertIn("but the session did not drop it", sentences)
+        self.assertNotIn("differs", sentences)
 
     def test_the_summary_took_what_its_session_recorded(self):
         self.session(7)
