@@ -212,20 +212,45 @@ void write(Writer& writer, const Value& value) {
   }
 }
 
-// Characters that control a terminal, or that make a line look like another one.
+// Characters that control a terminal, or that make a name look like another one or like none:
+// controls, marks of direction, separators and characters without a sign. Kept equal to those that
+// the page of the report shows by their numbers.
+constexpr std::array<std::pair<char32_t, char32_t>, 15> kHarmful{{{0x00, 0x1F},
+                                                                  {0x7F, 0x9F},
+                                                                  {0xAD, 0xAD},
+                                                                  {0x061C, 0x061C},
+                                                                  {0x115F, 0x1160},
+                                                                  {0x180E, 0x180E},
+                                                                  {0x200B, 0x200F},
+                                                                  {0x2028, 0x202E},
+                                                                  {0x2060, 0x206F},
+                                                                  {0x2800, 0x2800},
+                                                                  {0x3164, 0x3164},
+                                                                  {0xFEFF, 0xFEFF},
+                                                                  {0xFFA0, 0xFFA0},
+                                                                  {0xFFF9, 0xFFFB},
+                                                                  {0xE0000, 0xE007F}}};
+
 bool isHarmful(char32_t character) {
-  const bool isControl = character < 0x20 || (character >= 0x7F && character <= 0x9F);
-  const bool isSeparator = character == 0x2028 || character == 0x2029;
-  const bool reorders = (character >= 0x202A && character <= 0x202E) ||
-                        (character >= 0x2066 && character <= 0x2069) || character == 0x200E ||
-                        character == 0x200F || character == 0x061C;
-  return isControl || isSeparator || reorders;
+  if (character >= 0x20 && character < 0x7F) return false;  // most texts
+  return std::ranges::any_of(kHarmful, [character](const auto& range) {
+    return character >= range.first && character <= range.second;
+  });
 }
 
 void appendEscape(std::string& result, const char* format, unsigned number) {
   std::array<char, 16> escape{};
   std::snprintf(escape.data(), escape.size(), format, number);
   result += escape.data();
+}
+
+// As JSON escapes it: in two halves if it needs more than 16 bits.
+void appendEscaped(std::string& result, char32_t character) {
+  constexpr const char* kFormat = "\\u%04x";
+  constexpr char32_t kHalves = 0x10000;
+  if (character < kHalves) return appendEscape(result, kFormat, character);
+  appendEscape(result, kFormat, 0xD800 + ((character - kHalves) >> 10U));
+  appendEscape(result, kFormat, 0xDC00 + ((character - kHalves) & 0x3FFU));
 }
 
 enum class InvalidByte : std::uint8_t { kReplaced, kShown };
@@ -239,7 +264,7 @@ std::string harmless(std::string_view text, InvalidByte treatment) {
     if (step.valid && !isHarmful(step.character)) {
       result += text.substr(0, step.length);
     } else if (step.valid) {
-      appendEscape(result, "\\u%04x", static_cast<unsigned>(step.character));
+      appendEscaped(result, step.character);
     } else if (treatment == InvalidByte::kShown) {
       appendEscape(result, "\\x%02x", static_cast<unsigned char>(text.front()));
     } else {

@@ -24,11 +24,11 @@ std::string toJson(const platform::Value& value);
 // Formats a text as a JSON string with quotes. Bytes that are not UTF-8 become U+FFFD.
 std::string quoted(std::string_view text);
 
-// Escapes the characters of a JSON text that could control a terminal or reorder a line. Such
-// characters occur only inside strings, and escapes do not change the meaning.
+// Escapes the characters of a JSON text that could control a terminal, reorder a line or stay
+// invisible. Such characters occur only inside strings, and escapes do not change the meaning.
 std::string harmlessJson(std::string_view json);
 
-// Makes a text safe to print on one line: control characters become escapes.
+// Makes a text safe to print on one line: control characters and invisible ones become escapes.
 std::string harmlessText(std::string_view text);
 
 // Formats the fields of a JSON object as "key=value" with blanks between. Texts have no quotes

@@ -106,11 +106,20 @@ TEST(JsonTextTest, TextForATerminalHasNoControlCharacters) {
             "gr\xC3\xBC\xC3\x9F \xF0\x9F\x8E\xA7");
 }
 
+TEST(JsonTextTest, TextForATerminalHasNoInvisibleCharacters) {
+  EXPECT_EQ(harmlessText("pl\u200Bay\u00ADer\uFEFF\u2060\u180E\u3164"),
+            R"(pl\u200bay\u00ader\ufeff\u2060\u180e\u3164)");
+  EXPECT_EQ(harmlessText("a\U000E0041b"), R"(a\udb40\udc41b)");
+}
+
 TEST(JsonTextTest, JsonForATerminalStaysTheSameJson) {
   const std::string json = harmlessJson("{\"a\":\"\xC2\x9B\x7F\"}");
 
   EXPECT_EQ(json, R"({"a":"\u009b\u007f"})");
   EXPECT_EQ(dictionaryOf(json), dictionaryOf("{\"a\":\"\xC2\x9B\x7F\"}"));
+  const std::string tag = "{\"a\":\"\U000E0041\"}";
+  EXPECT_EQ(harmlessJson(tag), R"({"a":"\udb40\udc41"})");
+  EXPECT_EQ(dictionaryOf(harmlessJson(tag)), dictionaryOf(tag));
 }
 
 TEST(JsonTextTest, QuotedTextIsAlwaysJson) {

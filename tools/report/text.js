@@ -1,8 +1,8 @@
 // Numbers, times and texts as people read them.
 
 // Characters that control, hide or reorder what is shown: controls, marks of direction, zero-width
-// characters and byte order marks. Names come from clients.
-const HIDDEN = /[\u0000-\u001f\u007f-\u009f\u00ad\u061c\u115f\u180e\u200b-\u200f\u2028-\u202e\u2060-\u206f\u3164\ufeff\ufff9-\ufffb]/g;
+// characters and byte order marks. Names come from clients. Kept equal to those of JsonText.cpp.
+const HIDDEN = /[\u0000-\u001f\u007f-\u009f\u00ad\u061c\u115f\u1160\u180e\u200b-\u200f\u2028-\u202e\u2060-\u206f\u2800\u3164\ufeff\uffa0\ufff9-\ufffb]|\udb40[\udc00-\udc7f]/g;
 
 export function visible(text) {
   return String(text ?? "").replace(
