@@ -30,13 +30,6 @@ std::string_view beginningOf(std::string_view text, std::size_t bytes) {
   }
 }
 
-// The summary of a session has all keys of its messages, with all values in one text. Only its own
-// key says something new.
-bool isSummary(const Record& record) {
-  return record.kind == RecordKind::kLinkMessage && record.category == "Undefined" &&
-         record.type == "Unknown" && record.payload->text(kSummaryKey).has_value();
-}
-
 FieldType typeOfNumber(std::string_view text) {
   return text.find_first_of(".eE") == std::string_view::npos ? FieldType::kInteger
                                                              : FieldType::kNumber;
@@ -110,6 +103,8 @@ class FieldCollector::Values
     return true;
   }
   bool add(FieldType type, std::string_view text) {
+    // The summary of a session has all keys of its messages, with all values in one text. Only its
+    // own key says something new.
     if (depth_ != 1 || (isSummary_ && key_ != kSummaryKey)) return true;
     collector_.addValue(record_, place_, key_, type, text);
     return true;

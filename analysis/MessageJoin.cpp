@@ -26,13 +26,6 @@ std::uint64_t keyOf(const Record& record) {
   return key | 1U;
 }
 
-// A message of a client may have this key, too, but has the service's stamp as a number. The stamps
-// of a summary are a text.
-bool isSummary(const Record& record) {
-  return record.kind == RecordKind::kLinkMessage && record.type == "Unknown" &&
-         record.payload->text(kSummaryKey).has_value() && keyOf(record) == 0;
-}
-
 std::string_view payloadToKeep(const Record& record) {
   return isSummary(record) ? R"({"HV_Session_Summary_Event":""})" : record.payload->json();
 }
@@ -42,6 +35,12 @@ bool isSame(std::string_view text, std::string_view other) {
 }
 
 }  // namespace
+
+bool isSummary(const Record& record) {
+  // The stamp of a message is a number. The stamps of a summary are a text.
+  return record.kind == RecordKind::kLinkMessage && record.type == "Unknown" &&
+         record.payload->text(kSummaryKey).has_value() && keyOf(record) == 0;
+}
 
 void MessageJoin::add(const Record& record) {
   if (record.kind == RecordKind::kEvent) {
@@ -119,6 +118,7 @@ void MessageJoin::addSummary(const Record& record) {
   Waiting& summary = push(record, 0);
   summary.isComplete = true;
   summary.message.isLinkMessage = true;
+  summary.message.isSummary = true;
   summary.message.linkID = record.id;
   summary.message.sessionID = record.sessionID;
   summary.message.service = record.service;

@@ -14,8 +14,12 @@
 
 namespace halvox::analysis {
 
-// The key that only the summary of a session's run has.
+// The key of the summary of a session's run.
 inline constexpr std::string_view kSummaryKey = "HV_Session_Summary_Event";
+
+// True for the record of the summary of a session's run. A client can send a message with the same
+// names and key, but the service gives it a stamp of its own.
+[[nodiscard]] bool isSummary(const Record& record);
 
 // One message of a client, or of the service itself, with all that its records say.
 struct Message {
@@ -30,6 +34,7 @@ struct Message {
   std::string payload;                    // JSON
   bool isEvent = false;                   // it was recorded as an event
   bool isLinkMessage = false;             // it went through the link
+  bool isSummary = false;                 // it is the summary of a session's run
   // The IDs of its records; 0 if it has no such record.
   std::int64_t commonID = 0;   // the event under the name that all services share
   std::int64_t serviceID = 0;  // the event under the name of its service type

@@ -58,6 +58,17 @@ TEST_F(MessageJoinTest, AMessageThatOnlyTheLinkRecordedHasTheIDOfThatRecord) {
   EXPECT_THAT(delivered, ElementsAre(1));
 }
 
+TEST_F(MessageJoinTest, OnlyTheServiceMakesSummaries) {
+  std::vector<bool> areSummaries;
+  MessageJoin joining([&](const Message& message) { areSummaries.push_back(message.isSummary); });
+  records.link({}, "Undefined", "Unknown", R"("HV_Session_Summary_Event":"7")");
+  records.summary({});
+  EXPECT_TRUE(records.forEach({}, [&](const Record& record) { joining.add(record); }));
+  joining.finish();
+
+  EXPECT_THAT(areSummaries, UnorderedElementsAre(false, true));
+}
+
 TEST_F(MessageJoinTest, ASummaryComesBeforeTheMessagesOfTheNextRunEvenIfItWasRecordedLater) {
   records.message({}, "Session_Playback", "Stop");             // 1 to 3
   records.event({}, "Session_Playback", "Start");              // 4 and 5, of the next run

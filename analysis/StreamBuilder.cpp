@@ -22,11 +22,6 @@ constexpr std::int64_t kNoSession = -1;
 // threads.
 constexpr double kSameMoment = 1;
 
-bool isSummary(const Message& message, const Payload& payload) {
-  return message.isLinkMessage && !message.isEvent && message.type == "Unknown" &&
-         payload.text(kSummaryKey).has_value();
-}
-
 // True for what the service itself sends at the end of a session. It says nothing new of a stream.
 // Some of it has no stamp: its event and its link message cannot be brought together.
 bool isEndReport(const Message& message) {
@@ -85,7 +80,7 @@ void StreamBuilder::onMessage(const Message& message) {
     stream->setSessionID(*message.sessionID);
     bySession_.insert_or_assign(*message.sessionID, stream);
   }
-  if (isSummary(message, payload_)) {
+  if (message.isSummary) {
     endSession(*stream, message);
     return;
   }

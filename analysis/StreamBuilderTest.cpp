@@ -277,6 +277,17 @@ TEST_F(StreamBuilderTest, ASessionThatIsStartedAgainIsAnotherStory) {
   EXPECT_THAT(stories, SizeIs(2));
 }
 
+TEST_F(StreamBuilderTest, AMessageOfAClientThatLooksLikeASummaryEndsNoStory) {
+  start(0, session());
+  // Its events are not wanted, so that only the link recorded it.
+  at(1).link(session(), "Undefined", "Unknown", R"("HV_Session_Summary_Event":"7")");
+  stop(2, session());
+  records.summary(session());
+
+  EXPECT_EQ(story().end, StreamEnd::kStopped);
+  EXPECT_DOUBLE_EQ(story().ranSeconds, 2);
+}
+
 TEST_F(StreamBuilderTest, ASummaryThatIsRecordedDuringTheNextRunEndsTheRunBeforeIt) {
   start(0, session());
   stop(1, session());

@@ -35,11 +35,6 @@ std::optional<MessageName> parseName(const std::string& target) {
 
 }  // namespace
 
-bool isSummary(const Record& record) {
-  return record.kind == RecordKind::kLinkMessage && record.category == "Undefined" &&
-         record.type == "Unknown";
-}
-
 Explainer::Outcome Explainer::run(const std::function<std::string(std::int64_t)>& askService) {
   if (const auto number = parseNumber(request_.target)) return explainNumber(*number, askService);
   return explainName();

@@ -18,9 +18,6 @@
 
 namespace halvox::tools {
 
-// Whether a record is the summary of a session's run.
-[[nodiscard]] bool isSummary(const analysis::Record& record);
-
 // Explains over one store: what halvoxctl explain prints, as values. Belongs to one thread, for one
 // request. `request`, `complain` and `reader` must outlive it. Reports a failure to `complain`.
 class Explainer {

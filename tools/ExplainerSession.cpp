@@ -30,7 +30,7 @@ struct SessionTally {
     if (!message.application.empty() && applications.size() < kMostApplications) {
       applications.insert(message.application);
     }
-    if (!message.isEvent && message.category == "Undefined" && message.type == "Unknown") {
+    if (message.isSummary) {
       summaries.add(message.linkID);
       return;
     }
@@ -55,18 +55,17 @@ std::string baseSentence(const std::string& name, const MessageTally& tally) {
 
 Explainer::Outcome Explainer::explainSession(std::int64_t id, const std::string& answerOfService) {
   SessionTally session;
-  const auto failure =
-      replay([](const Record&) { return true; },
-             [&](const MessageFate& fate) {
-               if (fate.session == id) {
-                 session.add(fate);
-               } else if (!fate.session && !fate.message.isLinkMessage &&
-                          fate.link != LinkFate::kTestSession &&
-                          fate.message.service == session.service &&
-                          session.applications.contains(fate.message.application)) {
-                 ++session.unattributed;
-               }
-             });
+  const auto failure = replay(
+      [](const Record&) { return true; },
+      [&](const MessageFate& fate) {
+        if (fate.session == id) {
+          session.add(fate);
+        } else if (!fate.session && !fate.message.isLinkMessage &&
+                   fate.link != LinkFate::kTestSession && fate.message.service == session.service &&
+                   session.applications.contains(fate.message.application)) {
+          ++session.unattributed;
+        }
+      });
   if (failure) return *failure;
   Explanation explanation{.kind = "session",
                           .subject = "Session " + std::to_string(id) + ": " +

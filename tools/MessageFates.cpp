@@ -18,10 +18,6 @@ constexpr const char* kStampKey = "hvreporting_timestamp";
 constexpr const char* kTestService = "test";
 constexpr std::int64_t kNoSession = -1;  // the link's session ID outside sessions
 
-bool isSummary(const Message& message) {
-  return !message.isEvent && message.category == "Undefined" && message.type == "Unknown";
-}
-
 }  // namespace
 
 AudioEventCategory MessageFates::categoryOf(const std::string& name) {
@@ -61,7 +57,7 @@ void MessageFates::add(const Message& message) {
   if (!message.isEvent || message.category.empty()) {
     callback_(fate);
     // The next run of a session begins with an empty history.
-    if (isSummary(message) && message.sessionID) forgetSession(*message.sessionID);
+    if (message.isSummary && message.sessionID) forgetSession(*message.sessionID);
     return;
   }
   const auto content = comparable(message.payload);
@@ -86,8 +82,7 @@ void MessageFates::decide(const Message& message, const Dictionary& content, con
     fate.previous = previous->id;
     // The session would have dropped it. Between the two, its history was emptied or had another
     // message, and the store does not show that: the service was killed, for example.
-    fate.equalsPrevious =
-        SessionHistory::isRedundant(&previous->message, category, type, content);
+    fate.equalsPrevious = SessionHistory::isRedundant(&previous->message, category, type, content);
     return;
   }
   if (content.find(kStampKey) == nullptr) {

@@ -36,6 +36,7 @@ class MessageFatesTest : public testing::Test {
   Message summary(std::int64_t session) {
     Message message = linked(R"("HV_Session_Summary_Event":"7")", session);
     message.isEvent = false;
+    message.isSummary = true;
     message.category = "Undefined";
     message.type = "Unknown";
     return message;
