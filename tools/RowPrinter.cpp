@@ -1,7 +1,6 @@
 #include "tools/RowPrinter.h"
 
 #include <algorithm>
-#include <cstdlib>
 #include <numeric>
 
 #include "tools/JsonText.h"
@@ -45,15 +44,6 @@ std::string coloured(const std::string& text, const char* colour) {
 }
 
 }  // namespace
-
-bool isColourWanted() {
-  const auto valueOf = [](const char* variable) {
-    const char* const value = std::getenv(variable);
-    return value == nullptr ? std::string_view() : std::string_view(value);
-  };
-  const std::string_view terminal = valueOf("TERM");
-  return valueOf("NO_COLOR").empty() && !terminal.empty() && terminal != "dumb";
-}
 
 void RowPrinter::printJson(const std::string& json) {
   // After the members of the row, because they are what was recorded.

@@ -33,10 +33,6 @@ struct RowStyle {
   bool hasColour = false;
 };
 
-// Returns true if texts on this terminal may have colours: $NO_COLOR is unset or empty, and the
-// terminal is not "dumb".
-[[nodiscard]] bool isColourWanted();
-
 // Prints stored rows one by one, oldest or newest first. Belongs to one thread. Keeps no rows.
 //
 // Elsewhere than at a terminal a line is the time and the columns, with two blanks between them. At

@@ -121,17 +121,5 @@ TEST_F(RowPrinterTest, KnowsTheLastRow) {
   EXPECT_EQ(printer.rows(), 1U);
 }
 
-TEST_F(RowPrinterTest, ColoursAreForCapableTerminalsWithoutNoColor) {
-  unsetenv("NO_COLOR");
-  setenv("TERM", "xterm", 1);
-  EXPECT_TRUE(isColourWanted());
-  setenv("NO_COLOR", "1", 1);
-  EXPECT_FALSE(isColourWanted());
-  setenv("NO_COLOR", "", 1);
-  EXPECT_TRUE(isColourWanted());
-  setenv("TERM", "dumb", 1);
-  EXPECT_FALSE(isColourWanted());
-}
-
 }  // namespace
 }  // namespace halvox::tools

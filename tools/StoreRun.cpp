@@ -15,6 +15,7 @@
 #include "platform/linux/store/StoreSchema.h"
 #include "tools/Pager.h"
 #include "tools/ServiceConfiguration.h"
+#include "tools/TerminalColour.h"
 #include "tools/TextTable.h"
 
 namespace halvox::tools {

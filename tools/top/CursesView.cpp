@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <clocale>
 #include <cstdio>
-#include <cstdlib>
 #include <cwchar>
 #include <string>
 #include <string_view>
@@ -18,6 +17,7 @@
 #include <unistd.h>
 
 #include "platform/linux/base/Utf8.h"
+#include "tools/TerminalColour.h"
 #include "tools/top/TerminalType.h"
 
 namespace halvox::tools {
@@ -32,11 +32,6 @@ constexpr short kAlertPair = 1;
 // of a second would delay a bare Escape by that long.
 constexpr int kEscapeDelay = 50;
 
-bool wantsColour() {
-  const char* const none = std::getenv("NO_COLOR");
-  return none == nullptr || *none == '\0';
-}
-
 class CursesView final : public TopView {
  public:
   explicit CursesView(SCREEN* screen) : screen_(screen) {
@@ -47,7 +42,7 @@ class CursesView final : public TopView {
     curs_set(0);
     keypad(stdscr, TRUE);
     set_escdelay(kEscapeDelay);
-    if (!wantsColour() || !has_colors() || start_color() == ERR) return;
+    if (!isColourWanted() || !has_colors() || start_color() == ERR) return;
     // -1 is the terminal's own colour: readable on dark and on light backgrounds.
     hasColour_ = use_default_colors() != ERR && init_pair(kAlertPair, COLOR_RED, -1) != ERR;
   }
