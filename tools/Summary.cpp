@@ -4,21 +4,21 @@
 #include <array>
 #include <cstdio>
 #include <filesystem>
-#include <iomanip>
+#include <optional>
+#include <string>
 #include <utility>
 #include <variant>
+#include <vector>
 
-#include "tools/ColumnWidths.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/SummaryReader.h"
+#include "tools/TextTable.h"
 
 namespace halvox::tools {
 namespace {
 
 namespace fs = std::filesystem;
-
-using Row = std::array<std::string, 6>;
 
 struct Session {
   std::string file;
@@ -32,7 +32,7 @@ std::string secondsText(double seconds) {
   return text.data();
 }
 
-Row rowOf(const Session& session) {
+std::vector<std::string> rowOf(const Session& session) {
   const auto orDash = [](const std::string& text) {
     return text.empty() ? std::string("-") : harmlessText(text);
   };
@@ -46,15 +46,14 @@ Row rowOf(const Session& session) {
 }
 
 void printTable(const std::vector<Session>& sessions, std::ostream& out) {
-  std::vector<Row> rows = {{"TIME", "APPLICATION", "SERVICE", "MESSAGES", "SECONDS", "VOLUMES"}};
-  for (const Session& session : sessions) rows.push_back(rowOf(session));
-  const auto widths = columnWidths(rows);
-  for (const Row& row : rows) {
-    for (std::size_t column = 0; column + 1 < row.size(); ++column) {
-      out << std::left << std::setw(static_cast<int>(widths[column])) << row[column] << "  ";
-    }
-    out << row.back() << '\n';
-  }
+  TextTable table({{.heading = "TIME"},
+                   {.heading = "APPLICATION"},
+                   {.heading = "SERVICE"},
+                   {.heading = "MESSAGES"},
+                   {.heading = "SECONDS"},
+                   {.heading = "VOLUMES"}});
+  for (const Session& session : sessions) table.add(rowOf(session));
+  table.print(out, std::nullopt);
 }
 
 std::string jsonOf(const Session& session) {

@@ -24,9 +24,9 @@
 #include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/tracing/PlistPropertyListService.h"
-#include "tools/ColumnWidths.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
+#include "tools/TextTable.h"
 #include "tools/TraceResults.h"
 #include "tracing/TraceParamsParser.h"
 
@@ -48,7 +48,6 @@ constexpr std::chrono::seconds kRecordsWithin{15};
 constexpr std::chrono::milliseconds kLookEvery{5};
 
 using platform::Dictionary;
-using Row = std::array<std::string, 6>;
 
 std::string microseconds(double nanoseconds) {
   std::array<char, 64> text{};
@@ -57,22 +56,21 @@ std::string microseconds(double nanoseconds) {
 }
 
 void printTable(const TraceResults& results, std::ostream& out) {
-  std::vector<Row> rows = {{"NAME", "COUNT", "MIN us", "MEDIAN us", "P95 us", "MAX us"}};
+  constexpr auto kRight = TextTable::Align::kRight;
+  TextTable table({{.heading = "NAME"},
+                   {.heading = "COUNT", .align = kRight},
+                   {.heading = "MIN us", .align = kRight},
+                   {.heading = "MEDIAN us", .align = kRight},
+                   {.heading = "P95 us", .align = kRight},
+                   {.heading = "MAX us", .align = kRight}});
   for (const auto& [name, values] : results.values) {
     if (values.empty()) continue;
     const TraceStatistics found = statisticsOf(values);
-    rows.push_back({harmlessText(name), std::to_string(found.count), microseconds(found.minimum),
-                    microseconds(found.median), microseconds(found.percentile95),
-                    microseconds(found.maximum)});
+    table.add({harmlessText(name), std::to_string(found.count), microseconds(found.minimum),
+               microseconds(found.median), microseconds(found.percentile95),
+               microseconds(found.maximum)});
   }
-  const auto widths = columnWidths(rows);
-  for (const Row& row : rows) {
-    out << row[0] << std::string(widths[0] - row[0].size(), ' ');
-    for (std::size_t column = 1; column < row.size(); ++column) {
-      out << std::string(2 + widths[column] - row[column].size(), ' ') << row[column];
-    }
-    out << '\n';
-  }
+  table.print(out, std::nullopt);
 }
 
 void printJson(const TraceResults& results, std::ostream& out) {
