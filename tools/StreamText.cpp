@@ -7,6 +7,8 @@
 #include <cstdio>
 #include <string_view>
 
+#include "platform/linux/base/Utf8.h"
+#include "platform/value.h"
 #include "tools/JsonText.h"
 #include "tools/TimeText.h"
 
@@ -18,10 +20,16 @@ using analysis::StreamEnd;
 using analysis::StreamMoment;
 using analysis::StreamStory;
 using analysis::XrunTotals;
+using platform::Array;
+using platform::Dictionary;
+using platform::Value;
 
 constexpr const char* kNothing = "-";
 constexpr const char* kThen = " → ";
 constexpr std::size_t kUpToSeconds = 19;  // of "2026-11-21 22:44:05.123"
+// The volumes, formats and routes that a row shows. One long row makes all rows wide; the story of
+// the stream has everything.
+constexpr std::size_t kMostInRow = 8;
 
 template <typename... Values>
 std::string formatted(const char* format, Values... values) {
@@ -34,13 +42,21 @@ std::string orNothing(const std::string& text) {
   return text.empty() ? kNothing : harmlessText(text);
 }
 
-std::string joined(const std::vector<StreamChange>& changes, std::uint64_t notKept) {
+// The first `most` values, and how many others came after them.
+std::string joined(const std::vector<StreamChange>& changes, std::uint64_t notKept,
+                   std::size_t most) {
   std::string text;
   std::string_view last;
+  std::size_t shown = 0;
   for (const StreamChange& change : changes) {
     // A route may change its node names alone.
-    if (!text.empty() && change.text == last) continue;
+    if (shown > 0 && change.text == last) continue;
     last = change.text;
+    if (shown == most) {
+      ++notKept;
+      continue;
+    }
+    ++shown;
     text += (text.empty() ? "" : kThen) + harmlessText(change.text);
   }
   if (notKept > 0) text += kThen + formatted("%llu more", static_cast<unsigned long long>(notKept));
@@ -51,11 +67,19 @@ std::string volumeText(double volume) {
   return volume == 0 ? std::string("muted") : formatted("%.2f", volume);
 }
 
-std::string volumesText(const StreamStory& story) {
+// The volumes in the order of first use. Those beyond the first `most` are "others".
+std::string volumesText(const StreamStory& story, std::size_t most) {
   const double unknown = analysis::unknownVolumeSeconds(story);
   std::vector<std::pair<std::string, double>> parts;
-  for (const auto& time : story.volumes) parts.emplace_back(volumeText(time.volume), time.seconds);
-  if (story.otherVolumeSeconds > 0) parts.emplace_back("others", story.otherVolumeSeconds);
+  double others = story.otherVolumeSeconds;
+  for (const auto& time : story.volumes) {
+    if (parts.size() < most) {
+      parts.emplace_back(volumeText(time.volume), time.seconds);
+    } else {
+      others += time.seconds;
+    }
+  }
+  if (others > 0) parts.emplace_back("others", others);
   if (parts.empty()) return kNothing;
   if (unknown > 0) parts.emplace_back("unknown", unknown);
   if (parts.size() == 1) return parts.front().first;
@@ -77,7 +101,7 @@ std::string counted(std::uint64_t number, const char* one, const char* several) 
   return std::to_string(number) + " " + (number == 1 ? one : several);
 }
 
-// "; 2 because it was late, 1 because another stream was late"
+// ": 2 because this stream was late, 1 because another one was late"
 std::string rolesText(const XrunTotals& xruns) {
   std::string text;
   const auto add = [&](std::uint64_t number, const char* reason) {
@@ -151,38 +175,55 @@ const char* momentName(StreamMoment::Kind kind) {
   return "";
 }
 
-std::string number(double value) { return toJson(platform::Value(value)); }
+// Bytes that are not UTF-8 become U+FFFD, because a value must be UTF-8.
+Value textValue(std::string_view text) { return Value(platform::linux_::replaceInvalidUtf8(text)); }
 
-std::string changesJson(const std::vector<StreamChange>& changes, const char* name,
-                        const char* namesName) {
-  std::string json = "[";
+Value optionalValue(const std::optional<std::int64_t>& number) {
+  return number ? Value(*number) : Value();
+}
+
+Array formatValues(const std::vector<StreamChange>& changes) {
+  std::vector<Value> values;
   for (const StreamChange& change : changes) {
-    json += (json.size() == 1 ? "" : ",");
-    json += "{\"time\":" + number(change.time) + ",\"" + name + "\":" + tools::quoted(change.text);
-    if (namesName != nullptr) {
-      json += std::string(",\"") + namesName + "\":" + tools::quoted(change.names);
-    }
-    json += "}";
+    values.emplace_back(Dictionary{{"time", change.time}, {"format", textValue(change.text)}});
   }
-  return json + "]";
+  return Array(values);
 }
 
-std::string volumesJson(const StreamStory& story) {
-  std::string json = "[";
+Array routeValues(const std::vector<StreamChange>& changes) {
+  std::vector<Value> values;
+  for (const StreamChange& change : changes) {
+    values.emplace_back(Dictionary{{"time", change.time},
+                                   {"devices", textValue(change.text)},
+                                   {"device_node_names", textValue(change.names)}});
+  }
+  return Array(values);
+}
+
+Array volumeValues(const StreamStory& story) {
+  std::vector<Value> values;
   for (const auto& time : story.volumes) {
-    json += (json.size() == 1 ? "" : ",");
-    json += "{\"volume\":" + number(time.volume) + ",\"seconds\":" + number(time.seconds) + "}";
+    values.emplace_back(Dictionary{{"volume", time.volume}, {"seconds", time.seconds}});
   }
-  return json + "]";
+  return Array(values);
 }
 
-std::string xrunsJson(const XrunTotals& xruns) {
-  return "{\"reports\":" + std::to_string(xruns.reports) +
-         ",\"missed_cycles\":" + std::to_string(xruns.missedCycles) +
-         ",\"milliseconds\":" + number(xruns.milliseconds) +
-         ",\"as_culprit\":" + std::to_string(xruns.asCulprit) +
-         ",\"as_victim\":" + std::to_string(xruns.asVictim) +
-         ",\"by_device\":" + std::to_string(xruns.byDevice) + "}";
+Dictionary xrunValues(const XrunTotals& xruns) {
+  return {{"reports", xruns.reports},           {"missed_cycles", xruns.missedCycles},
+          {"milliseconds", xruns.milliseconds}, {"as_culprit", xruns.asCulprit},
+          {"as_victim", xruns.asVictim},        {"by_device", xruns.byDevice}};
+}
+
+void addXrun(Dictionary& json, const StreamMoment::Xrun& xrun) {
+  json.set("milliseconds", xrun.milliseconds);
+  json.set("missed_cycles", xrun.missedCycles);
+  json.set("quantum", xrun.quantum);
+  json.set("rate", xrun.rate);
+  json.set("role", textValue(xrun.role));
+  json.set("device", textValue(xrun.device));
+  json.set("late_node", textValue(xrun.lateNode));
+  json.set("late_process", textValue(xrun.lateProcess));
+  json.set("late_object_serial", optionalValue(xrun.lateObjectSerial));
 }
 
 }  // namespace
@@ -232,10 +273,10 @@ std::vector<std::string> streamRow(const StreamStory& story) {
           orNothing(story.application),
           orNothing(story.service),
           orNothing(std::string(analysis::directionName(story.direction))),
-          joined(story.routes, story.routesNotKept),
+          joined(story.routes, story.routesNotKept, kMostInRow),
           durationText(story.ranSeconds),
-          volumesText(story),
-          joined(story.formats, story.formatsNotKept),
+          volumesText(story, kMostInRow),
+          joined(story.formats, story.formatsNotKept, kMostInRow),
           xrunsText(story.xruns),
           std::string(analysis::endName(story.end))};
 }
@@ -259,7 +300,9 @@ std::string describeStream(const StreamStory& story) {
   } else if (story.ranSeconds > 0) {
     text += "No xrun was reported.\n";
   }
-  if (story.volumes.size() > 1) text += "Volumes: " + volumesText(story) + ".\n";
+  if (story.volumes.size() > 1) {
+    text += "Volumes: " + volumesText(story, analysis::kMostStoryVolumes) + ".\n";
+  }
   return text;
 }
 
@@ -291,61 +334,46 @@ std::string describeMoment(const StreamStory& story, const StreamMoment& moment)
 }
 
 std::string streamJson(const StreamStory& story, std::optional<std::size_t> momentsNotShown) {
-  const auto optional = [](const std::optional<std::int64_t>& value) {
-    return value ? std::to_string(*value) : std::string("null");
-  };
   const bool hasEnded = story.end != StreamEnd::kStillRunning;
-  std::string json = "{\"id\":" + std::to_string(story.id);
-  json += ",\"session_id\":" + optional(story.sessionID);
-  json += ",\"object_serial\":" + optional(story.objectSerial);
-  json += ",\"application\":" + tools::quoted(story.application);
-  json += ",\"service\":" + tools::quoted(story.service);
-  json += ",\"direction\":" + tools::quoted(analysis::directionName(story.direction));
-  json += ",\"started\":" + number(story.started);
-  json += ",\"ended\":" + (hasEnded ? number(story.ended) : "null");
-  json += ",\"end\":" + tools::quoted(analysis::endName(story.end));
-  json += ",\"ran_seconds\":" + number(story.ranSeconds);
-  json += ",\"volumes\":" + volumesJson(story);
-  json += ",\"other_volume_seconds\":" + number(story.otherVolumeSeconds);
-  json += ",\"unknown_volume_seconds\":" + number(analysis::unknownVolumeSeconds(story));
-  json += ",\"formats\":" + changesJson(story.formats, "format", nullptr);
-  json += ",\"routes\":" + changesJson(story.routes, "devices", "device_node_names");
-  json += ",\"xruns\":" + xrunsJson(story.xruns);
-  json += ",\"messages\":" + std::to_string(story.messages);
-  if (momentsNotShown) json += ",\"moments_not_shown\":" + std::to_string(*momentsNotShown);
-  json += "}";
-  return harmlessJson(json);
+  Dictionary json{{"id", story.id},
+                  {"session_id", optionalValue(story.sessionID)},
+                  {"object_serial", optionalValue(story.objectSerial)},
+                  {"application", textValue(story.application)},
+                  {"service", textValue(story.service)},
+                  {"direction", analysis::directionName(story.direction)},
+                  {"started", story.started},
+                  {"ended", hasEnded ? Value(story.ended) : Value()},
+                  {"end", analysis::endName(story.end)},
+                  {"ran_seconds", story.ranSeconds},
+                  {"volumes", volumeValues(story)},
+                  {"other_volume_seconds", story.otherVolumeSeconds},
+                  {"unknown_volume_seconds", analysis::unknownVolumeSeconds(story)},
+                  {"formats", formatValues(story.formats)},
+                  {"routes", routeValues(story.routes)},
+                  {"xruns", xrunValues(story.xruns)},
+                  {"messages", story.messages}};
+  if (momentsNotShown) json.set("moments_not_shown", std::uint64_t{*momentsNotShown});
+  return harmlessJson(toJson(json));
 }
 
 std::string momentJson(const StreamMoment& moment) {
-  std::string json = "{\"time\":" + number(moment.time);
-  json += ",\"moment\":" + tools::quoted(momentName(moment.kind));
-  json += ",\"message_id\":" + std::to_string(moment.messageID);
+  Dictionary json{
+      {"time", moment.time}, {"moment", momentName(moment.kind)}, {"message_id", moment.messageID}};
   switch (moment.kind) {
     case StreamMoment::Kind::kFormat:
     case StreamMoment::Kind::kMessage:
-      json += ",\"text\":" + tools::quoted(moment.text);
+      json.set("text", textValue(moment.text));
       break;
     case StreamMoment::Kind::kRoute:
-      json += ",\"devices\":" + tools::quoted(moment.text);
-      json += ",\"device_node_names\":" + tools::quoted(moment.names);
+      json.set("devices", textValue(moment.text));
+      json.set("device_node_names", textValue(moment.names));
       break;
     case StreamMoment::Kind::kVolume:
-      json += ",\"volume\":" + number(moment.volume);
-      json += std::string(",\"playing\":") + (moment.playing ? "true" : "false");
+      json.set("volume", moment.volume);
+      json.set("playing", moment.playing);
       break;
     case StreamMoment::Kind::kXrun:
-      json += ",\"milliseconds\":" + number(moment.xrun.milliseconds);
-      json += ",\"missed_cycles\":" + std::to_string(moment.xrun.missedCycles);
-      json += ",\"quantum\":" + std::to_string(moment.xrun.quantum);
-      json += ",\"rate\":" + std::to_string(moment.xrun.rate);
-      json += ",\"role\":" + tools::quoted(moment.xrun.role);
-      json += ",\"device\":" + tools::quoted(moment.xrun.device);
-      json += ",\"late_node\":" + tools::quoted(moment.xrun.lateNode);
-      json += ",\"late_process\":" + tools::quoted(moment.xrun.lateProcess);
-      json +=
-          ",\"late_object_serial\":" +
-          (moment.xrun.lateObjectSerial ? std::to_string(*moment.xrun.lateObjectSerial) : "null");
+      addXrun(json, moment.xrun);
       break;
     case StreamMoment::Kind::kBegan:
     case StreamMoment::Kind::kStart:
@@ -353,7 +381,7 @@ std::string momentJson(const StreamMoment& moment) {
     case StreamMoment::Kind::kEnded:
       break;
   }
-  return harmlessJson(json + "}");
+  return harmlessJson(toJson(json));
 }
 
 }  // namespace halvox::tools

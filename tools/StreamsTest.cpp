@@ -166,6 +166,58 @@ TEST(StreamTextTest, ARowHasChangesInOrder) {
   EXPECT_EQ(row[10], "client gone");
 }
 
+TEST(StreamTextTest, ARowShowsTheFirstOfManyChanges) {
+  StreamStory story;
+  for (int number = 0; number < 20; ++number) {
+    story.volumes.push_back({.volume = 0.01 * number, .seconds = 1});
+    story.routes.push_back({.time = 0, .text = std::to_string(number), .names = {}});
+  }
+  story.otherVolumeSeconds = 5;
+  story.ranSeconds = 25;
+  story.routesNotKept = 3;
+
+  const std::vector<std::string> row = streamRow(story);
+  EXPECT_EQ(row[5], "0 → 1 → 2 → 3 → 4 → 5 → 6 → 7 → 15 more");
+  EXPECT_EQ(row[7],
+            "muted 1.0s, 0.01 1.0s, 0.02 1.0s, 0.03 1.0s, 0.04 1.0s, 0.05 1.0s, 0.06 1.0s, "
+            "0.07 1.0s, others 17.0s");
+  // The story has all.
+  EXPECT_THAT(describeStream(story), HasSubstr("0.19 1.0s, others 5.0s.\n"));
+}
+
+TEST(StreamTextTest, JsonHasEveryMemberAndIsValidWhateverTheTexts) {
+  StreamStory story;
+  story.id = 7;
+  story.sessionID = -1;
+  story.application = "\xFF\"\x1B\u200B";
+  story.started = 1;
+  story.volumes = {{.volume = 0.5, .seconds = 2}};
+  story.formats = {{.time = 1, .text = "F32LE", .names = {}}};
+  story.routes = {{.time = 1, .text = "A", .names = "a"}};
+
+  EXPECT_EQ(
+      streamJson(story),
+      R"({"id":7,"session_id":-1,"object_serial":null,"application":"�\"\u001B\u200b","service":"",)"
+      R"("direction":"","started":1.0,"ended":null,"end":"still running","ran_seconds":0.0,)"
+      R"("volumes":[{"volume":0.5,"seconds":2.0}],"other_volume_seconds":0.0,)"
+      R"("unknown_volume_seconds":0.0,"formats":[{"time":1.0,"format":"F32LE"}],)"
+      R"("routes":[{"time":1.0,"devices":"A","device_node_names":"a"}],)"
+      R"("xruns":{"reports":0,"missed_cycles":0,"milliseconds":0.0,"as_culprit":0,"as_victim":0,)"
+      R"("by_device":0},"messages":0})");
+  EXPECT_THAT(streamJson(story, 3), HasSubstr(R"("messages":0,"moments_not_shown":3})"));
+
+  StreamMoment moment;
+  moment.kind = StreamMoment::Kind::kVolume;
+  moment.playing = true;
+  EXPECT_EQ(momentJson(moment),
+            R"({"time":0.0,"moment":"volume","message_id":0,"volume":0.0,"playing":true})");
+  moment.kind = StreamMoment::Kind::kXrun;
+  EXPECT_EQ(momentJson(moment),
+            R"({"time":0.0,"moment":"xrun","message_id":0,"milliseconds":0.0,"missed_cycles":0,)"
+            R"("quantum":0,"rate":0,"role":"","device":"","late_node":"","late_process":"",)"
+            R"("late_object_serial":null})");
+}
+
 TEST(StreamTextTest, SaysWhoWasLate) {
   StreamMoment moment;
   moment.kind = StreamMoment::Kind::kXrun;
