@@ -12,16 +12,15 @@ import statistics
 import subprocess
 import sys
 import tempfile
-import time
 from pathlib import Path
 
 sys.path.insert(0, str(Path(__file__).resolve().parents[2] / "tests" / "system"))
 
 import browser  # noqa: E402
+import usage  # noqa: E402
 
 PROGRAMS = Path(os.environ["HALVOX_BIN"]).resolve()
 ROUNDS = 5
-KIBIBYTES_PER_MEBIBYTE = 1024
 PAINTS = """({
   "first paint": performance.getEntriesByName("first-contentful-paint")[0]?.startTime,
   "page complete": performance.getEntriesByName("report-ready")[0]?.startTime})"""
@@ -29,15 +28,10 @@ PAINTS = """({
 
 def run(*command):
     """Seconds by the clock and of the processor, and the most MiB that were resident."""
-    begin = time.monotonic()
-    with open(os.devnull, "wb") as nothing:
-        process = subprocess.Popen(command, stdout=nothing)
-        _, status, usage = os.wait4(process.pid, 0)
-        process.returncode = os.waitstatus_to_exitcode(status)
-    if process.returncode != 0:
-        sys.exit(f"{' '.join(map(str, command))}: status {process.returncode}")
-    return (time.monotonic() - begin, usage.ru_utime + usage.ru_stime,
-            usage.ru_maxrss / KIBIBYTES_PER_MEBIBYTE)
+    status, *used = usage.run(command)
+    if status != 0:
+        sys.exit(f"{' '.join(map(str, command))}: status {status}")
+    return used
 
 
 def measure(label, *command):
