@@ -184,6 +184,7 @@ Value optionalValue(const std::optional<std::int64_t>& number) {
 
 Array formatValues(const std::vector<StreamChange>& changes) {
   std::vector<Value> values;
+  values.reserve(changes.size());
   for (const StreamChange& change : changes) {
     values.emplace_back(Dictionary{{"time", change.time}, {"format", textValue(change.text)}});
   }
@@ -192,6 +193,7 @@ Array formatValues(const std::vector<StreamChange>& changes) {
 
 Array routeValues(const std::vector<StreamChange>& changes) {
   std::vector<Value> values;
+  values.reserve(changes.size());
   for (const StreamChange& change : changes) {
     values.emplace_back(Dictionary{{"time", change.time},
                                    {"devices", textValue(change.text)},
@@ -202,6 +204,7 @@ Array routeValues(const std::vector<StreamChange>& changes) {
 
 Array volumeValues(const StreamStory& story) {
   std::vector<Value> values;
+  values.reserve(story.volumes.size());
   for (const auto& time : story.volumes) {
     values.emplace_back(Dictionary{{"volume", time.volume}, {"seconds", time.seconds}});
   }

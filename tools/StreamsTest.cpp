@@ -17,7 +17,6 @@ namespace {
 using analysis::StreamEnd;
 using analysis::StreamMoment;
 using analysis::StreamStory;
-using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::Not;
 
