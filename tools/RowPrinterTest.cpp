@@ -28,8 +28,8 @@ class RowPrinterTest : public testing::Test {
     RowPrinter printer(out, std::move(style));
     double time = 100;
     for (const auto& [name, fields] : rows) {
-      std::vector<RowCell> cells{
-          {.text = name, .look = RowCell::Look::kName, .keepsEnd = true}, {.text = fields}};
+      std::vector<RowCell> cells{{.text = name, .look = RowCell::Look::kName, .keepsEnd = true},
+                                 {.text = fields}};
       printer.print(
           static_cast<std::int64_t>(time), time, [&] { return cells; },
           [] { return std::string("{\"n\":1}"); });
