@@ -70,7 +70,8 @@ class StreamsTest(unittest.TestCase):
             client.send({"issue_type": "xrun", "xrun_milliseconds": milliseconds, "missed_cycles": 2,
                          "xrun_role": "victim"}, SESSION_PLAYBACK, ISSUE, [session])
         # The service reports only what took longer than a second.
-        time_before = self.json("sql", "SELECT max(time) AS time FROM halvox_events")[0]["time"] or 0
+        time_before = wait_for("the first messages", lambda: self.json(
+            "sql", "SELECT max(time) AS time FROM halvox_events")[0]["time"])
         wait_for("a second to pass", lambda: self.now() - time_before > 1.2)
         self.set_volume(client, 7, 0.25, True)
         self.set_volume(client, 7, 0.25, False)
