@@ -17,7 +17,7 @@
 #
 # DIRECTORY must exist, and must be short: a socket's path has at most 107 bytes.
 
-HALVOX_AUDIO_TOOLS=(dbus-daemon pipewire wireplumber pw-cli pw-dump pw-play pw-record)
+HALVOX_AUDIO_TOOLS=(dbus-daemon dbus-send pipewire wireplumber pw-cli pw-dump pw-play pw-record)
 
 # Prints the missing tools; returns 1 if there are any.
 halvox_audio_check() {
@@ -96,7 +96,12 @@ halvox_audio_enter() {
   export DBUS_SESSION_BUS_ADDRESS=unix:path=$directory/run/bus
 }
 
-halvox_audio_socket_exists() { [ -S "$1" ]; }
+# Both servers are asked instead of looked for: a socket's file exists before the server listens, and
+# WirePlumber ends at once when it is refused then.
+halvox_audio_bus_answers() {
+  dbus-send --session --print-reply --dest=org.freedesktop.DBus / org.freedesktop.DBus.GetId
+}
+halvox_audio_pipewire_answers() { pw-cli info 0; }
 
 # Whether WirePlumber links streams to the sink. A sink becomes the default when it has ports, and
 # this one gets them from WirePlumber, after the scripts that link streams have been loaded. With
@@ -104,16 +109,24 @@ halvox_audio_socket_exists() { [ -S "$1" ]; }
 # stream that came then would be refused with "no node available".
 halvox_audio_has_default_sink() { pw-dump | grep -q '"default.audio.sink"'; }
 
+# Waits for what the process just started must do: DIRECTORY WHAT SECONDS COMMAND. Shows all logs if
+# it does not.
+halvox_audio_wait() {
+  local directory=$1
+  shift
+  halvox_wait_for_start "$HALVOX_PID" "$@" && return
+  tail -n 15 "$directory"/*.log >&2
+  return 1
+}
+
 halvox_audio_start_servers() {
   local directory=$1
   halvox_start pipewire "$directory/pipewire.log" pipewire -c "$directory/pipewire.conf"
   HALVOX_PIPEWIRE_PID=$HALVOX_PID
-  halvox_wait_for_start "$HALVOX_PID" "PipeWire's socket" 10 \
-    halvox_audio_socket_exists "$XDG_RUNTIME_DIR/pipewire-0"
+  halvox_audio_wait "$directory" "PipeWire" 10 halvox_audio_pipewire_answers
   halvox_start wireplumber "$directory/wireplumber.log" wireplumber
   HALVOX_WIREPLUMBER_PID=$HALVOX_PID
-  halvox_wait_for_start "$HALVOX_PID" "WirePlumber to find the sink" 20 \
-    halvox_audio_has_default_sink
+  halvox_audio_wait "$directory" "WirePlumber to find the sink" 20 halvox_audio_has_default_sink
 }
 
 halvox_audio_stop_servers() {
@@ -130,8 +143,7 @@ halvox_audio_start() {
   halvox_start dbus-daemon "$directory/dbus.log" dbus-daemon --session --nofork --nopidfile \
     "--address=$DBUS_SESSION_BUS_ADDRESS"
   HALVOX_BUS_PID=$HALVOX_PID
-  halvox_wait_for_start "$HALVOX_PID" "the private bus" 10 \
-    halvox_audio_socket_exists "$XDG_RUNTIME_DIR/bus"
+  halvox_audio_wait "$directory" "the private bus" 10 halvox_audio_bus_answers
   halvox_audio_start_servers "$directory"
 }
 
