@@ -11,7 +11,8 @@ because some checks look only at the main file.
 - source_units.py decides which sources share a unit. What it misses, such as two classes of one name
   in headers of libraries, makes a unit that does not compile, which only costs time.
 - A use in one source hides an unused using-declaration in another. A source is therefore read a second
-  time by itself, with only that check, if a name of its using-declarations occurs elsewhere in its unit.
+  time by itself, with only that check, if a name of its using-declarations occurs elsewhere in its unit
+  and the source does not plainly use it.
 
     clang_tidy.py BUILD_DIRECTORY < names of sources, one a line
 
@@ -27,11 +28,14 @@ import sys
 from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
-from source_units import Source, plan
+from source_units import Source, plan, words_and_marks
 
 USING_CHECK = "misc-unused-using-decls"
 
-USING_DECLARATION = re.compile(r"\busing\s+(?:typename\s+)?((?:::)?\w+(?:::\w+)+\s*[;,][^;]*)")
+USING_DECLARATION = re.compile(r"\busing\s+(?:typename\s+)?((?:::)?\w+(?:::\w+)+\s*(?:,[^;]*)?);")
+# A name after one of these is used, not declared and not that of a member. The list is short on purpose: a
+# use that it misses only makes clang-tidy read the source again.
+BEFORE_USE = {"(", ",", "<", "{", "}", ";", "=", "return", "const"}
 
 
 def options_of(command):
@@ -64,11 +68,20 @@ def read_sources(build, paths):
     return sources
 
 
+def plainly_used(text):
+    """The names that a source uses without a qualification, as far as its text shows it."""
+    tokens = words_and_marks(USING_DECLARATION.sub(";;", text))
+    return {token for (before, _), (token, is_word) in zip(tokens, tokens[1:])
+            if is_word and before in BEFORE_USE}
+
+
 def may_be_hidden(source, unit):
-    """Whether another source of the unit may use a name of a using-declaration of this source."""
+    """Whether a using-declaration of this source may be unused and another source of the unit hide it."""
     names = {name for text in USING_DECLARATION.findall(source.text)
              for name in re.findall(r"(\w+)\s*(?:[;,]|$)", text)}
-    return any(not names.isdisjoint(other.words) for other in unit.sources if other is not source)
+    if all(names.isdisjoint(other.words) for other in unit.sources if other is not source):
+        return False
+    return not names <= plainly_used(source.text)
 
 
 def write_units(build, units):

@@ -161,6 +161,22 @@ class Findings(unittest.TestCase):
         [unit] = plan(read_sources(self.build, paths))
         self.assertEqual([may_be_hidden(source, unit) for source in unit.sources], [True, False])
 
+    def test_only_a_plain_use_shows_that_a_name_is_not_hidden(self):
+        other = "#include <utility>\nstd::pair<int, int> other() { return {1, 2}; }\n"
+        using = "#include <utility>\nusing std::pair;\n"
+        for text, hidden in (
+            ("pair<int, int> one() { return {1, 2}; }\n", False),
+            ("int one() { return static_cast<int>(sizeof(pair<int, int>)); }\n", False),
+            ("std::pair<int, int> one() { return {1, 2}; }\n", True),
+            ("struct Own { int pair; };\nint one(Own own) { return own.pair; }\n", True),
+            ("int one(int* pair) { return *pair; }\n", True),
+            ("// pair\nconst char* one() { return \"(pair)\"; }\n", True),
+        ):
+            with self.subTest(text):
+                paths = self.write({"a.cpp": using + text, "b.cpp": other})
+                [unit] = plan(read_sources(self.build, paths))
+                self.assertEqual(may_be_hidden(unit.sources[0], unit), hidden)
+
     def test_sources_without_findings_pass(self):
         run = self.run_script(self.write({"a.cpp": CLEAN % "first", "b.cpp": CLEAN % "second"}))
         self.assertEqual((run.returncode, run.stdout, run.stderr), (0, "", ""))
