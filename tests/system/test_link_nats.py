@@ -464,7 +464,7 @@ class ServiceTest(NatsTest):
 
 
 class ClusterTest(NatsTest):
-    SESSIONS = 100
+    SESSIONS = 40
     MESSAGES = 1000
 
     def setUp(self):
