@@ -634,6 +634,29 @@ class SecurityTest(NatsTest):
                 self.assertTrue(driver.found(1)[0])
                 driver.end()
 
+    def test_a_device_needs_only_the_permissions_of_the_fleet_guide(self):
+        device = ('{ user: "device", password: "d", permissions: {'
+                  ' publish: ["fleet.device4711.>", "$JS.API.STREAM.INFO.FLEET"], subscribe: ["_INBOX.>"] } }')
+        users = f'authorization {{ users: [ {{ user: "admin", password: "a" }}, {device} ] }}'
+        with Server(users) as server:
+            admin, device = (server.url.replace("nats://", f"nats://{user}@")
+                             for user in ("admin:a", "device:d"))
+            with Driver(admin, extra='stream = "FLEET"\nsubject = "fleet"') as driver:
+                driver.start(1)
+                self.assertTrue(driver.found(1)[0])
+                driver.end()
+            subject = "fleet.device4711"
+            with Driver(device, extra=f'stream = "FLEET"\nsubject = "{subject}"') as driver:
+                driver.start(1)
+                self.assertTrue(driver.found(1)[0])
+                driver.send(1, 10)
+                driver.flush(1)
+                driver.end()
+
+            self.assertEqual(driver.flushed(f"{subject}.playback_session.1"), [(10, 0)])
+            self.assertEqual(numbers_of(read_stream(admin, "FLEET"), f"{subject}.playback_session.1"),
+                             list(range(10)))
+
     def test_a_credentials_file_that_is_missing_finds_no_server(self):
         with Server() as server, Driver(server.url, extra='credentials = "/nowhere/user.creds"') as driver:
             driver.start(1)
