@@ -95,7 +95,7 @@ class LinkTest(DropInTest):
             _, client = self.run_session(server, ["link-nats.conf"])
             client.stop(REPORTER)
 
-            wait_for("the message", lambda: [record for record in nats.read_stream(server.url)
+            wait_for("the message", lambda: [record for record in nats.try_read_stream(server.url)
                                              if record["message"]["payload"].get("number") == 1])
 
     def test_the_server_is_out_of_reach_without_it(self):

@@ -9,7 +9,7 @@ from pathlib import Path
 
 from harness import SERVICE, Service, require, wait_for
 from nats import (DRIVER, LONG_DEADLINE, TLS_GREETING, Driver, Operator, Server, SilentServer, cluster, free_ports,
-                  numbers_of, read_stream)
+                  numbers_of, read_stream, try_read_stream)
 
 SUBJECT = "halvox.playback_session"
 APIUSAGE = 12  # the service type of that name
@@ -107,7 +107,7 @@ class DeliveryTest(NatsTest):
     def test_a_single_message_needs_no_session(self):
         with Server() as server, Driver(server.url) as driver:
             self.assertEqual(driver.ask("one alarms"), "sent 1 0 ".strip())
-            records = wait_for("the stream", lambda: self._try_read(server))
+            records = wait_for("the stream", lambda: try_read_stream(server.url))
             driver.end()
 
             self.assertEqual([record["subject"] for record in records], ["halvox.alarms.-1"])
@@ -139,13 +139,6 @@ class DeliveryTest(NatsTest):
 
             self.assertEqual(counters["failed: refused"], 1)
             self.assertNotIn("a message was taken after the end", driver.log)
-
-    @staticmethod
-    def _try_read(server):
-        try:
-            return read_stream(server.url)
-        except AssertionError:  # the stream has not been created
-            return []
 
 
 class FailureTest(NatsTest):
@@ -381,16 +374,9 @@ class ServiceTest(NatsTest):
 
     def messages_of(self, url, reporter):
         """The numbered messages, without the summary at the end, in the order of the stream."""
-        return [record["message"] for record in self.try_read(url)
+        return [record["message"] for record in try_read_stream(url)
                 if record["subject"].endswith(f".{reporter}")
                 and isinstance(record["message"]["payload"].get("number"), int)]
-
-    @staticmethod
-    def try_read(url):
-        try:
-            return read_stream(url)
-        except AssertionError:  # the stream has not been created
-            return []
 
     def test_stop_flushes_the_messages_of_a_session_in_order(self):
         with Server() as server, self.service(server.url) as service:
@@ -502,7 +488,7 @@ class ClusterTest(NatsTest):
             # Messages that a flush gave up waiting for are confirmed when there is a leader again.
             driver.wait_until_acknowledged(self.SESSIONS * self.MESSAGES)
             driver.end()
-        records = wait_for("the stream", lambda: self._try_read(self.follower.url), LONG_DEADLINE, pause=0.5)
+        records = wait_for("the stream", lambda: try_read_stream(self.follower.url), LONG_DEADLINE, pause=0.5)
         self._check(driver, records)
 
     def _leader(self):
@@ -532,13 +518,6 @@ class ClusterTest(NatsTest):
             driver.start(100_000)
             return driver.found(100_000)[0]
         wait_for("a leader", ready, LONG_DEADLINE)
-
-    @staticmethod
-    def _try_read(url):
-        try:
-            return read_stream(url)
-        except AssertionError:  # no leader for a moment
-            return []
 
 
 class SecurityTest(NatsTest):
