@@ -37,7 +37,7 @@ std::string serviceHelp(std::string_view configurationFile) {
          "\n"
          "Options:\n"
          "  -h, --help  Print this help\n"
-         "  --version   Print the version\n"
+         "  --version   Print the version, the commit and the optional parts\n"
          "\n"
          "All settings are in a TOML file. Without it they have their defaults. The service\n"
          "would now read this file:\n"

@@ -11,7 +11,8 @@
 #include "platform/connection.h"
 #include "platform/linux/LinuxPlatform.h"
 #include "platform/linux/configuration/Configuration.h"
-#include "platform/linux/runtime/Version.h"
+#include "platform/linux/version/Commit.h"
+#include "platform/linux/version/VersionText.h"
 #include "platform/services.h"
 #include "service/HVReportingServiceDelegate.h"
 #include "service/ReportingQueue.h"
@@ -22,7 +23,10 @@ namespace {
 using namespace halvox;
 using platform::linux_::Configuration;
 using platform::linux_::ConfigurationError;
+using platform::linux_::halvoxCommit;
 using platform::linux_::LinuxPlatform;
+using platform::linux_::serviceParts;
+using platform::linux_::versionText;
 
 int refuse(int exitStatus, const std::string& why) {
   std::fprintf(stderr, "halvox-reportingd: %s\n", why.c_str());
@@ -70,7 +74,7 @@ int run(std::span<const char* const> arguments) {
     case Request::kShowHelp:
       return print(serviceHelp(platform::linux_::configurationPath().string()));
     case Request::kShowVersion:
-      return print(std::string("halvox-reportingd ") + platform::linux_::halvoxVersion() + "\n");
+      return print(versionText("halvox-reportingd", halvoxCommit(), serviceParts()) + "\n");
     case Request::kMistake:
       return refuse(EX_USAGE, parsed.mistake);
   }

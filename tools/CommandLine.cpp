@@ -7,7 +7,6 @@
 
 #include <CLI/CLI.hpp>
 
-#include "platform/linux/runtime/Version.h"
 #include "tools/CommandSet.h"
 #include "tools/JsonText.h"
 #include "tools/commands/Commands.h"
@@ -194,7 +193,8 @@ CommandLineText describe(const CLI::ParseError& error, const CLI::App& app, Comm
 }
 
 // Adds all commands of `source` to `app`, which has the parser's settings but no commands yet.
-void addEverything(CLI::App& app, CommandSet& commands, CommandSource source) {
+void addEverything(CLI::App& app, CommandSet& commands, CommandSource source,
+                   const std::string& version) {
   if (source == CommandSource::kScriptLine) {
     app.description(
         "Requests to the Halvox reporting service, one on each line, over one connection.");
@@ -202,8 +202,8 @@ void addEverything(CLI::App& app, CommandSet& commands, CommandSource source) {
         "'COMMAND --help' explains a command; 'quit' or the end of the input ends the shell.");
   } else {
     app.name("halvoxctl");
-    app.set_version_flag("--version", std::string("halvoxctl ") + platform::linux_::halvoxVersion(),
-                         "Print the version");
+    app.set_version_flag("--version", version,
+                         "Print the version, the commit and the optional parts");
     app.footer(kExitStatusNote);
   }
   app.require_subcommand(1);
@@ -227,16 +227,17 @@ DescribedCommand describeCommandLine() {
   nameThings(app);
   std::istringstream noInput;
   CommandSet commands(app, CommandSource::kArguments, noInput);
-  addEverything(app, commands, CommandSource::kArguments);
+  addEverything(app, commands, CommandSource::kArguments, "");
   return describeCommands(app);
 }
 
 std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string> arguments,
-                                                        CommandSource source, std::istream& input) {
+                                                        CommandSource source, std::istream& input,
+                                                        const std::string& version) {
   CLI::App app(kWhatItIs);
   nameThings(app);
   CommandSet commands(app, source, input);
-  addEverything(app, commands, source);
+  addEverything(app, commands, source, version);
 
   std::ranges::reverse(arguments);  // as the library wants them
   // The library reports everything with exceptions. None leaves this function.
@@ -244,8 +245,8 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
     app.parse(std::move(arguments));
   } catch (const CLI::CallForHelp&) {
     return CommandLineText{ExitStatus::kDone, helpOf(app)};
-  } catch (const CLI::CallForVersion& version) {
-    return CommandLineText{ExitStatus::kDone, std::string(version.what()) + "\n"};
+  } catch (const CLI::CallForVersion& shown) {
+    return CommandLineText{ExitStatus::kDone, std::string(shown.what()) + "\n"};
   } catch (const CLI::ParseError& error) {
     return describe(error, app, source);
   }

@@ -30,8 +30,10 @@ enum class CommandSource : std::uint8_t {
 };
 
 // Parses the arguments without the program's name. Reads `input` to its end if a JSON argument is
-// "-". Throws nothing.
+// "-". `version` is the text of --version, without a line end; lines of a script have no such
+// option. Throws nothing.
 std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string> arguments,
-                                                        CommandSource source, std::istream& input);
+                                                        CommandSource source, std::istream& input,
+                                                        const std::string& version = {});
 
 }  // namespace halvox::tools

@@ -472,9 +472,11 @@ TEST(CommandLineTest, TheHelpOfTheShellIsAboutItsLines) {
 }
 
 TEST(CommandLineTest, PrintsItsVersion) {
-  const auto parsed = parse({"--version"});
+  std::istringstream noInput;
+  const auto parsed = parseCommandLine({"--version"}, CommandSource::kArguments, noInput,
+                                       "halvoxctl 1.2\nBuilt with: x");
 
-  EXPECT_EQ(std::get<CommandLineText>(parsed).text.substr(0, 10), "halvoxctl ");
+  EXPECT_EQ(std::get<CommandLineText>(parsed).text, "halvoxctl 1.2\nBuilt with: x\n");
 }
 
 TEST(CommandLineTest, ScriptLinesHaveTheirOwnCommandsAndNotAll) {

@@ -7,9 +7,11 @@
 #include "tools/Complaint.h"
 
 namespace halvox::tools {
-ExitStatus runTool(std::vector<std::string> arguments, const ToolStreams& streams) {
+ExitStatus runTool(std::vector<std::string> arguments, const std::string& version,
+                   const ToolStreams& streams) {
   const bool isJson = asksForJson(arguments);
-  auto parsed = parseCommandLine(std::move(arguments), CommandSource::kArguments, streams.input);
+  auto parsed =
+      parseCommandLine(std::move(arguments), CommandSource::kArguments, streams.input, version);
   ExitStatus status = ExitStatus::kDone;
   if (const auto* text = std::get_if<CommandLineText>(&parsed)) {
     (text->status == ExitStatus::kDone ? streams.output : streams.errors) << text->text;

@@ -10,6 +10,8 @@
 
 #include "client/HalvoxClient.h"
 #include "platform/linux/configuration/Configuration.h"
+#include "platform/linux/version/Commit.h"
+#include "platform/linux/version/VersionText.h"
 #include "reporters/pipewire/HalvoxReportingClient.h"
 #include "reporters/pipewire/MainLoop.h"
 #include "reporters/pipewire/StreamTracker.h"
@@ -47,7 +49,9 @@ void declareOptions(CLI::App& app, Arguments& arguments) {
   app.add_flag("--verbose", arguments.verbose, "Log each operation and message on standard error");
   app.add_flag("--no-xruns", arguments.noXruns,
                "Do not report xruns; saves several wake-ups a second while streams run");
-  app.set_version_flag("--version", std::string("halvox-pipewire-reporter " HALVOX_VERSION));
+  using namespace halvox::platform;
+  app.set_version_flag("--version",
+                       linux_::versionText("halvox-pipewire-reporter", linux_::halvoxCommit(), {}));
 }
 
 void logLosses(const halvox::client::Counters& counters, const StreamTracker& tracker) {

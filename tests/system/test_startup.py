@@ -2,6 +2,7 @@
 
 import contextlib
 import os
+import re
 import shutil
 import signal
 import sqlite3
@@ -11,7 +12,7 @@ import unittest
 from pathlib import Path
 
 import harness
-from harness import SERVICE, Service, wait_for
+from harness import BIN, SERVICE, Service, wait_for
 
 EX_USAGE, EX_DATAERR, EX_NOINPUT, EX_UNAVAILABLE, EX_CANTCREAT, EX_CONFIG = 64, 65, 66, 69, 73, 78
 
@@ -78,17 +79,39 @@ class Startup(unittest.TestCase):
         self.assert_refused(result, EX_NOINPUT, "halvox.toml")
 
     def test_help_and_version_answer_without_starting_anything(self):
-        version = subprocess.run([harness.CTL, "--version"], capture_output=True, text=True, check=True)
-
         for arguments, shown in ((["--help"], "Usage: halvox-reportingd"), (["-h"], "--version"),
                                  (["--help"], "halvox.toml"),
-                                 (["--version"], version.stdout.replace("halvoxctl", "halvox-reportingd"))):
+                                 (["--version"], "halvox-reportingd ")):
             with self.subTest(arguments=arguments):
                 result = self.run_service(None, arguments)
 
                 self.assertEqual((result.returncode, result.stderr), (0, ""))
                 self.assertIn(shown, result.stdout)
         self.assertEqual(list(self.directory.iterdir()), [])
+
+    def test_each_program_shows_one_version_and_the_commit_that_was_built(self):
+        made = BIN.parent / "generated/platform/linux/version/Commit.cpp"
+        commit = " \\([0-9a-f]{12,}\\)" if re.search('return ".+"', made.read_text()) else ""
+        versions = set()
+        for name in "halvox-reportingd", "halvoxctl", "halvox-pipewire-reporter":
+            if not (BIN / name).exists():
+                continue
+            shown = subprocess.run([BIN / name, "--version"], capture_output=True, text=True, check=True).stdout
+            found = re.fullmatch(f"{name} ([0-9.]+){commit}", shown.splitlines()[0])
+            self.assertTrue(found, shown)
+            versions.add(found[1])
+        self.assertEqual(len(versions), 1, versions)
+
+    def test_the_service_names_each_optional_part_as_built_or_not(self):
+        shown = self.run_service(None, ["--version"]).stdout
+        built = "".join(re.findall("^Built with: (.*)$", shown, re.MULTILINE)).split(", ")
+        absent = "".join(re.findall("^Built without: (.*)$", shown, re.MULTILINE)).split(", ")
+
+        for part, module in (("NATS link", "halvox-link-nats"), ("PipeWire counters", "halvox-drivers-pipewire"),
+                             ("LTTng trace points", "halvox-kdebug-lttng"),
+                             ("LTTng traces", "halvox-tracing-lttng")):
+            with self.subTest(part):
+                self.assertIn(part, built if (BIN / f"{module}.so").exists() else absent)
 
     def test_unknown_argument_is_named_before_the_configuration_is_looked_at(self):
         result = self.run_service("this is wrong", ["--bogus"])
