@@ -1,6 +1,7 @@
 #include "tools/ExplainSinks.h"
 
 #include "backends/HVReportingJoulebookUtility.h"
+#include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
 namespace {
@@ -124,7 +125,7 @@ void addByType(std::vector<Sink>& sinks, const std::string& type, const ExplainS
                    .why = isIssue ? "Each message of type IssueDetector makes a metric; `halvoxctl "
                                     "metrics` lists them."
                                   : "Only messages of type IssueDetector make a metric."});
-  const bool isCaptured = isEnergy && isInternalBuild(settings);
+  const bool isCaptured = isEnergy && isInternalBuild(settings.configuration);
   sinks.push_back(
       {.name = kCapture,
        .took = isCaptured ? Took::kUnknown : Took::kNo,
@@ -136,7 +137,7 @@ void addByType(std::vector<Sink>& sinks, const std::string& type, const ExplainS
 }
 
 Sink traceSink(const std::string& service, const ExplainSettings& settings) {
-  if (service == "test" && isTracingOn(settings)) {
+  if (service == "test" && isTracingOn(settings.configuration)) {
     return {.name = kTrace,
             .took = Took::kUnknown,
             .why =
@@ -151,7 +152,7 @@ Sink traceSink(const std::string& service, const ExplainSettings& settings) {
 }
 
 Sink summaryFileSink(const ExplainSettings& settings) {
-  if (!isInternalBuild(settings)) {
+  if (!isInternalBuild(settings.configuration)) {
     return {.name = kSummaryFile,
             .took = Took::kNo,
             .why = "device.InternalBuild is not true: no summary files are written."};

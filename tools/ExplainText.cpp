@@ -10,6 +10,7 @@
 #include "client/Vocabulary.h"
 #include "platform/linux/configuration/LinkBackendName.h"
 #include "platform/linux/store/EventNames.h"
+#include "tools/ServiceConfiguration.h"
 #include "tools/TimeText.h"
 
 namespace halvox::tools {
@@ -110,19 +111,6 @@ bool isWanted(const ExplainSettings& settings, const std::string& eventName) {
   return platform::linux_::EventNames(settings.configuration.analytics.wanted).matches(eventName);
 }
 
-bool isInternalBuild(const ExplainSettings& settings) {
-  const platform::Value* value = settings.configuration.device.find("InternalBuild");
-  return value != nullptr && value->isNumber() && value->toBool();
-}
-
-bool isTracingOn(const ExplainSettings& settings) {
-  const auto& features = settings.configuration.features;
-  const auto domain = features.find("Acoustat");
-  if (domain == features.end()) return false;
-  const auto tracing = domain->second.find("Tracing");
-  return tracing != domain->second.end() && tracing->second;
-}
-
 std::string backendName(const ExplainSettings& settings) {
   return platform::linux_::linkBackendName(settings.configuration.link.backend);
 }
@@ -186,9 +174,9 @@ std::vector<Explanation::Setting> settingsThatDecide(const ExplainSettings& sett
           {"storage.retention_days", std::to_string(configuration.storage.retentionDays),
            "storage: older records are deleted, the oldest ones also above max_megabytes."},
           {"storage.max_megabytes", std::to_string(configuration.storage.maxMegabytes), ""},
-          {"device.InternalBuild", onOff(isInternalBuild(settings)),
+          {"device.InternalBuild", onOff(isInternalBuild(settings.configuration)),
            "device.InternalBuild: only internal builds write summary files and captures."},
-          {"features.Acoustat.Tracing", onOff(isTracingOn(settings)),
+          {"features.Acoustat.Tracing", onOff(isTracingOn(settings.configuration)),
            "features.Acoustat.Tracing: without it, no session is traced."}};
 }
 

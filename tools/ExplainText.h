@@ -49,8 +49,6 @@ struct EventNamePair {
 
 // What the configuration says.
 [[nodiscard]] bool isWanted(const ExplainSettings& settings, const std::string& eventName);
-[[nodiscard]] bool isInternalBuild(const ExplainSettings& settings);
-[[nodiscard]] bool isTracingOn(const ExplainSettings& settings);
 [[nodiscard]] std::string backendName(const ExplainSettings& settings);
 
 // The settings that decide, and what cannot be known, in sentences.

@@ -10,6 +10,7 @@
 
 #include "client/ServicePlaces.h"
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
+#include "platform/linux/configuration/ConfiguredFeatureFlagService.h"
 #include "platform/linux/store/StoreSchema.h"
 
 namespace halvox::tools {
@@ -68,6 +69,16 @@ std::variant<std::string, ExitStatus> namedSocket(const CommonOptions& options,
   const auto named = platform::linux_::configuredSocket();
   if (named) return named->native();
   return complain(ExitStatus::kBadConfiguration, named.error().message);
+}
+
+bool isInternalBuild(const Configuration& configuration) {
+  const platform::Value* value = configuration.device.find("InternalBuild");
+  return value != nullptr && value->isNumber() && value->toBool();
+}
+
+bool isTracingOn(const Configuration& configuration) {
+  const platform::linux_::ConfiguredFeatureFlagService features(configuration.features);
+  return features._os_feature_enabled_impl("Acoustat", "Tracing");
 }
 
 std::variant<std::filesystem::path, ExitStatus> findStore(const Complaint& complain) {

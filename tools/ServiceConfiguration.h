@@ -22,6 +22,10 @@ std::variant<platform::linux_::Configuration, ExitStatus> serviceConfiguration(
 std::variant<std::string, ExitStatus> namedSocket(const CommonOptions& options,
                                                   const Complaint& complain);
 
+// What the configuration switches on. Both are off unless it names them.
+[[nodiscard]] bool isInternalBuild(const platform::linux_::Configuration& configuration);
+[[nodiscard]] bool isTracingOn(const platform::linux_::Configuration& configuration);
+
 // Returns the directory of the store: the one that the configuration names, without looking at it,
 // else the user's if it holds a store, else the system's if that holds one. If there is none,
 // reports all places that were tried.

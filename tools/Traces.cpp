@@ -170,13 +170,6 @@ bool recordsSoon(const fs::path& storage, const Names& before) {
   return false;
 }
 
-bool isTracingOn(const platform::linux_::Configuration& configuration) {
-  const auto domain = configuration.features.find("Acoustat");
-  if (domain == configuration.features.end()) return false;
-  const auto feature = domain->second.find("Tracing");
-  return feature != domain->second.end() && feature->second;
-}
-
 // A session that the service traces from its start to its stop.
 class TracedSession {
  public:

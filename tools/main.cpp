@@ -17,10 +17,10 @@ namespace {
 std::string version() {
   namespace linux_ = halvox::platform::linux_;
   const linux_::OptionalPart parts[] = {
-      {"report page", !halvox::tools::reportPageBeforeData().empty()},
-      {"screen", HALVOX_HAS_SCREEN != 0},
-      {"ALSA counters", linux_::hasAlsaSource()},
-      {"PipeWire counters", HALVOX_HAS_PIPEWIRE != 0},
+      {"report page", "HALVOX_REPORT", !halvox::tools::reportPageBeforeData().empty()},
+      {"screen", "HALVOX_SCREEN", HALVOX_HAS_SCREEN != 0},
+      {"ALSA counters", "HALVOX_ALSA", linux_::hasAlsaSource()},
+      {"PipeWire counters", "HALVOX_PIPEWIRE", HALVOX_HAS_PIPEWIRE != 0},
   };
   return linux_::versionText("halvoxctl", linux_::halvoxCommit(), parts);
 }

@@ -19,7 +19,7 @@ struct ServiceCost {
   std::optional<std::uint64_t> bytesWritten{};
 };
 
-// Something that is off, and the setting that says so.
+// Something that is off, and the setting or the option of the build that says so.
 struct SwitchedOff {
   std::string what;
   std::string why;

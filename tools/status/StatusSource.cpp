@@ -13,18 +13,20 @@
 #include <unistd.h>
 
 #include "client/HalvoxClient.h"
-#include "platform/linux/drivers/ConfiguredSources.h"
 #include "platform/linux/runtime/Version.h"
 #include "platform/linux/store/StoreSchema.h"
 #include "platform/linux/store/reading/StoreUse.h"
+#include "tools/ServiceConfiguration.h"
 #include "tools/TimeText.h"
 #include "tools/top/TopModel.h"
 
 namespace halvox::tools {
 namespace {
 
+using platform::linux_::BusKind;
 using platform::linux_::Configuration;
 using platform::linux_::LinkBackend;
+using platform::linux_::OptionalPart;
 
 constexpr std::uint64_t kMebibyte = 1024 * 1024;
 
@@ -153,6 +155,24 @@ ServicePlaces placesOf(const Configuration& configuration) {
   return places;
 }
 
+// Empty if the configuration leaves the part on. The service loads the link to NATS only if it is
+// the one in use, and the trace points also for its own traces.
+std::string settingThatSwitchesOff(std::string_view option, const Configuration& configuration) {
+  const bool isTraced = isTracingOn(configuration);
+  if (option == "HALVOX_ALSA" && !configuration.drivers.alsa) return "drivers.alsa is false";
+  if (option == "HALVOX_PIPEWIRE" && !configuration.drivers.pipewire) {
+    return "drivers.pipewire is false";
+  }
+  if (option == "HALVOX_NATS" && configuration.link.backend != LinkBackend::kNats) {
+    return "link.backend is not \"nats\"";
+  }
+  if (option == "HALVOX_WITH_LTTNG" && !configuration.tracePoints && !isTraced) {
+    return "diagnostics.trace_points is not true";
+  }
+  if (option == "HALVOX_TRACING" && !isTraced) return "features.Acoustat.Tracing is not true";
+  return "";
+}
+
 }  // namespace
 
 std::optional<std::uint64_t> cpuTicks(std::string_view stat) {
@@ -191,7 +211,8 @@ std::optional<std::uint64_t> numberAfter(std::string_view text, std::string_view
   return std::nullopt;
 }
 
-std::vector<SwitchedOff> switchedOff(const Configuration& configuration) {
+std::vector<SwitchedOff> switchedOff(const Configuration& configuration,
+                                     std::span<const OptionalPart> parts) {
   std::vector<SwitchedOff> off;
   if (configuration.link.backend == LinkBackend::kNone) {
     off.push_back({"real-time link", "link.backend is \"none\""});
@@ -200,13 +221,19 @@ std::vector<SwitchedOff> switchedOff(const Configuration& configuration) {
   if (std::ranges::find(wanted, "*") == wanted.end()) {
     off.push_back({"some events", "analytics.wanted does not contain \"*\""});
   }
-  if (!configuration.drivers.alsa) {
-    off.push_back({"ALSA counters", "drivers.alsa is false"});
-  } else if (!platform::linux_::hasAlsaSource()) {
-    off.push_back({"ALSA counters", "this build has no HALVOX_ALSA"});
+  if (configuration.listener.bus == BusKind::kNone) {
+    off.push_back({"message bus", "listener.bus is \"none\""});
   }
-  if (!configuration.drivers.pipewire) {
-    off.push_back({"PipeWire counters", "drivers.pipewire is false"});
+  if (!isInternalBuild(configuration)) {
+    off.push_back({"summary files, captures", "device.InternalBuild is not true"});
+  }
+  for (const OptionalPart& part : parts) {
+    std::string setting = settingThatSwitchesOff(part.option, configuration);
+    if (!setting.empty()) {
+      off.push_back({std::string(part.name), std::move(setting)});
+    } else if (!part.isBuilt) {
+      off.push_back({std::string(part.name), "this build has no " + std::string(part.option)});
+    }
   }
   return off;
 }
@@ -234,7 +261,7 @@ ServiceStatus readStatus(const Configuration& configuration, const std::string& 
   status.storeLimitBytes = storage.maxMegabytes * kMebibyte;
   status.retentionDays = storage.retentionDays;
   status.keptCaptures = configuration.keepSnapshots;
-  status.off = switchedOff(configuration);
+  status.off = switchedOff(configuration, platform::linux_::serviceParts());
   return status;
 }
 

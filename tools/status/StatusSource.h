@@ -3,11 +3,13 @@
 #include <chrono>
 #include <cstdint>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "platform/linux/configuration/Configuration.h"
+#include "platform/linux/version/VersionText.h"
 #include "tools/status/ServiceStatus.h"
 
 namespace halvox::tools {
@@ -20,9 +22,11 @@ namespace halvox::tools {
                                        const std::string& socket,
                                        std::chrono::milliseconds timeout);
 
-// Returns what a configuration switches off, with the settings that do.
+// Returns what a configuration switches off, with the settings that do, and what a build with these
+// `parts` lacks. Of two reasons it gives the setting.
 [[nodiscard]] std::vector<SwitchedOff> switchedOff(
-    const platform::linux_::Configuration& configuration);
+    const platform::linux_::Configuration& configuration,
+    std::span<const platform::linux_::OptionalPart> parts);
 
 // Returns the processor time of a process in clock ticks, from the text of /proc/PID/stat; nothing
 // if the text is malformed.

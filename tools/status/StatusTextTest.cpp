@@ -1,5 +1,6 @@
 #include "tools/status/StatusText.h"
 
+#include <span>
 #include <sstream>
 #include <string>
 
@@ -12,8 +13,11 @@
 namespace halvox::tools {
 namespace {
 
+using platform::linux_::BusKind;
 using platform::linux_::Configuration;
 using platform::linux_::LinkBackend;
+using platform::linux_::OptionalPart;
+using platform::linux_::serviceParts;
 using testing::AllOf;
 using testing::HasSubstr;
 using testing::Not;
@@ -111,6 +115,24 @@ TEST(StatusSourceTest, ANumberOfProcfsIsThatOfTheWholeName) {
   EXPECT_EQ(numberAfter("write_bytes: x", "write_bytes"), std::nullopt);
 }
 
+std::string reasons(const Configuration& configuration, std::span<const OptionalPart> parts) {
+  std::string all;
+  for (const SwitchedOff& off : switchedOff(configuration, parts)) {
+    all += off.what + ": " + off.why + "\n";
+  }
+  return all;
+}
+
+Configuration withEverythingOn() {
+  Configuration configuration;
+  configuration.link.backend = LinkBackend::kNats;
+  configuration.listener.bus = BusKind::kSystem;
+  configuration.tracePoints = true;
+  configuration.device = {{"InternalBuild", true}};
+  configuration.features["Acoustat"]["Tracing"] = true;
+  return configuration;
+}
+
 TEST(StatusSourceTest, WhatIsSwitchedOffNamesTheSetting) {
   Configuration configuration;
   configuration.link.backend = LinkBackend::kNone;
@@ -118,12 +140,31 @@ TEST(StatusSourceTest, WhatIsSwitchedOffNamesTheSetting) {
   configuration.drivers.alsa = false;
   configuration.drivers.pipewire = false;
 
-  std::string all;
-  for (const SwitchedOff& off : switchedOff(configuration)) all += off.why + "\n";
+  EXPECT_EQ(reasons(configuration, serviceParts()),
+            "real-time link: link.backend is \"none\"\n"
+            "some events: analytics.wanted does not contain \"*\"\n"
+            "message bus: listener.bus is \"none\"\n"
+            "summary files, captures: device.InternalBuild is not true\n"
+            "ALSA counters: drivers.alsa is false\n"
+            "PipeWire counters: drivers.pipewire is false\n"
+            "NATS link: link.backend is not \"nats\"\n"
+            "LTTng trace points: diagnostics.trace_points is not true\n"
+            "LTTng traces: features.Acoustat.Tracing is not true\n");
+}
 
-  EXPECT_EQ(all,
-            "link.backend is \"none\"\nanalytics.wanted does not contain \"*\"\n"
-            "drivers.alsa is false\ndrivers.pipewire is false\n");
+TEST(StatusSourceTest, WhatThisBuildLacksIsOffToo) {
+  const OptionalPart parts[] = {{"NATS link", "HALVOX_NATS", false},
+                                {"LTTng traces", "HALVOX_TRACING", true}};
+
+  EXPECT_EQ(reasons(withEverythingOn(), parts), "NATS link: this build has no HALVOX_NATS\n");
+}
+
+TEST(StatusSourceTest, TracesSwitchTheTracePointsOn) {
+  const OptionalPart parts[] = {{"LTTng trace points", "HALVOX_WITH_LTTNG", true}};
+  Configuration configuration = withEverythingOn();
+  configuration.tracePoints = false;
+
+  EXPECT_EQ(reasons(configuration, parts), "");
 }
 
 }  // namespace

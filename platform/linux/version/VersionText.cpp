@@ -7,9 +7,11 @@ namespace {
 
 // The build defines each of these as 0 or 1.
 constexpr OptionalPart kServiceParts[] = {
-    {"ALSA counters", HALVOX_HAS_ALSA != 0},   {"PipeWire counters", HALVOX_HAS_PIPEWIRE != 0},
-    {"NATS link", HALVOX_HAS_NATS != 0},       {"LTTng trace points", HALVOX_HAS_TRACE_POINTS != 0},
-    {"LTTng traces", HALVOX_HAS_TRACING != 0},
+    {"ALSA counters", "HALVOX_ALSA", HALVOX_HAS_ALSA != 0},
+    {"PipeWire counters", "HALVOX_PIPEWIRE", HALVOX_HAS_PIPEWIRE != 0},
+    {"NATS link", "HALVOX_NATS", HALVOX_HAS_NATS != 0},
+    {"LTTng trace points", "HALVOX_WITH_LTTNG", HALVOX_HAS_TRACE_POINTS != 0},
+    {"LTTng traces", "HALVOX_TRACING", HALVOX_HAS_TRACING != 0},
 };
 
 void appendParts(std::string& text, std::string_view heading, std::span<const OptionalPart> parts,

@@ -9,6 +9,7 @@ namespace halvox::platform::linux_ {
 // A part that a build may lack, because of an option of CMake.
 struct OptionalPart {
   std::string_view name;
+  std::string_view option;  // such as "HALVOX_NATS"
   bool isBuilt = false;
 };
 

@@ -23,7 +23,8 @@ TEST(VersionTextTest, WithoutACommitThereIsOnlyTheVersion) {
 }
 
 TEST(VersionTextTest, ThePartsAreSortedByWhetherTheyAreBuilt) {
-  const OptionalPart parts[] = {{"one", true}, {"two", false}, {"three", true}, {"four", false}};
+  const OptionalPart parts[] = {
+      {"one", "", true}, {"two", "", false}, {"three", "", true}, {"four", "", false}};
 
   EXPECT_EQ(versionText("x", "ab", parts), std::string("x ") + halvoxVersion() +
                                                " (ab)\nBuilt with: one, three\n"
@@ -31,7 +32,7 @@ TEST(VersionTextTest, ThePartsAreSortedByWhetherTheyAreBuilt) {
 }
 
 TEST(VersionTextTest, AHeadingWithoutPartsIsNotPrinted) {
-  const OptionalPart part[] = {{"one", false}};
+  const OptionalPart part[] = {{"one", "", false}};
 
   EXPECT_EQ(versionText("x", "", part),
             std::string("x ") + halvoxVersion() + "\nBuilt without: one");
