@@ -5,6 +5,8 @@
 #include <utility>
 #include <vector>
 
+#include "platform/linux/store/blocks/MessageBlockReader.h"
+
 namespace halvox::platform::linux_ {
 namespace {
 
@@ -119,9 +121,10 @@ SqliteCode MessageBlocks::sealOpenRows() {
 // Adds the records of a block to writer_. Records older than `newerThan` become gaps.
 SqliteCode MessageBlocks::gatherBlock(std::string_view block, std::int64_t records,
                                       std::optional<double> newerThan) {
-  reader_.open(block, records);
-  while (reader_.next()) {
-    const BlockRecord& record = reader_.record();
+  MessageBlockReader reader;  // a member would keep the memory of a long payload
+  reader.open(block, records);
+  while (reader.next()) {
+    const BlockRecord& record = reader.record();
     const bool isAged = newerThan.has_value() && record.time < *newerThan;
     if (record.kind == BlockRecordKind::kGap || isAged) {
       writer_.addGap();
@@ -139,7 +142,7 @@ SqliteCode MessageBlocks::gatherBlock(std::string_view block, std::int64_t recor
                       record.payload);
     }
   }
-  return reader_.isDamaged() ? SQLITE_CORRUPT : SQLITE_OK;
+  return reader.isDamaged() ? SQLITE_CORRUPT : SQLITE_OK;
 }
 
 void MessageBlocks::note(double time) {
@@ -243,6 +246,12 @@ void MessageBlocks::clearGathered() {
   if (writer_.records() > 0) sealedBytes_ += writer_.bytes();
   writer_.clear();
   gathered_ = {};
+}
+
+// Frees the memory of a long payload now, because the next record may come only after hours.
+void MessageBlocks::onCommitted() {
+  clearGathered();
+  sealedBytes_ = 0;
 }
 
 void MessageBlocks::onRolledBack() {

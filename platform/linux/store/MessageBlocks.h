@@ -5,7 +5,6 @@
 #include <string_view>
 
 #include "platform/linux/store/Sqlite.h"
-#include "platform/linux/store/blocks/MessageBlockReader.h"
 #include "platform/linux/store/blocks/MessageBlockWriter.h"
 
 namespace halvox::platform::linux_ {
@@ -52,7 +51,7 @@ class MessageBlocks {
   // Returns the length of this transaction's records before compression, in bytes.
   [[nodiscard]] std::uint64_t bytes() const { return sealedBytes_ + writer_.bytes(); }
 
-  void onCommitted() { sealedBytes_ = 0; }
+  void onCommitted();
   // Called after a failed transaction. The numbers of its records will be used again.
   void onRolledBack();
 
@@ -102,7 +101,6 @@ class MessageBlocks {
 
   Statements statements_;
   MessageBlockWriter writer_;
-  MessageBlockReader reader_;
   Gathered gathered_;
   std::uint64_t sealedBytes_ = 0;  // of the blocks that this transaction has written
 

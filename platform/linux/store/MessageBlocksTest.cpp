@@ -3,6 +3,8 @@
 #include <string>
 #include <vector>
 
+#include <malloc.h>
+
 #include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/store/reading/EventFollower.h"
 #include "platform/linux/store/reading/StoreReader.h"
@@ -92,6 +94,25 @@ TEST_F(MessageBlocksTest, RowsThatHaveGatheredBecomeOneBlockWithTheSameNumbers) 
   EXPECT_EQ(value("SELECT group_concat(span) FROM message_spans"), "1");
   EXPECT_EQ(value("SELECT sum(records), max(id + records) FROM message_blocks"), "300|301");
   EXPECT_EQ(payloads(), numberedTo(300));
+}
+
+TEST_F(MessageBlocksTest, KeepsNoMemoryOfALongPayload) {
+  constexpr std::size_t kMiB = std::size_t{1} << 20U;
+  // With a sanitizer, this is always 0.
+  const auto inUse = [] {
+    const auto info = ::mallinfo2();
+    return info.uordblks + info.hblkhd;
+  };
+  start();
+  sendAlone(0);
+  const std::size_t before = inUse();
+
+  service->sendAnalyticsEventLazy("long", [] {
+    return Dictionary{{"text", std::string(8 * kMiB, 'x')}};
+  });
+  ASSERT_TRUE(allIsStored());
+
+  EXPECT_TRUE(eventually([&] { return inUse() < before + kMiB; }));
 }
 
 // Few long payloads fill the open rows before there are many records, and they shrink when their
