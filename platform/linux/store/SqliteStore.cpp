@@ -69,7 +69,8 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
       retention_({.age = std::chrono::days(options.retentionDays),
                   .databaseBytes = sizes_.databaseBytes,
                   .transactionBytes = sizes_.transactionBytes}),
-      runs_(environment.clock, options.bootID) {}
+      runs_(environment.clock, options.bootID),
+      vacuum_(files_.database()) {}
 
 Result<void, StoreError> SqliteStore::open() {
   configureLibrary();
@@ -82,6 +83,7 @@ Result<void, StoreError> SqliteStore::open() {
 }
 
 void SqliteStore::close() {
+  vacuum_.cancel();
   queue_.close();
   if (writer_.joinable()) writer_.join();
 }
@@ -100,6 +102,7 @@ void SqliteStore::run() {
     if (const auto finding = check_.finding()) replaceDamaged(*finding);
     writeTaken();
     maintainWhileIdle();
+    vacuumOnce();
     releaseMemoryIfIdle();
   }
   writeEnd();
@@ -351,6 +354,26 @@ bool SqliteStore::maintainOnce() {
   return false;
 }
 
+bool SqliteStore::beginVacuum(const VacuumRequest& request) {
+  if (!vacuum_.begin(request)) return false;
+  queue_.requestRound();
+  return true;
+}
+
+// Runs one step of a vacuum. The next round, which stores the records that have come meanwhile,
+// runs the next step.
+void SqliteStore::vacuumOnce() {
+  if (!vacuum_.isRunning()) return;
+  if (!database_.isOpen()) return vacuum_.fail("the database is not open");
+  errno = 0;
+  const SqliteCode code = vacuum_.runOnce(database_, kinds_);
+  if (code != SQLITE_OK) {
+    vacuum_.fail(database_.errorText());
+    return fail(code, "cannot vacuum the database");
+  }
+  if (vacuum_.isRunning()) queue_.requestRound();
+}
+
 void SqliteStore::closeDatabase() {
   const bool isChecked = check_.stop();
   releaseStatements();
@@ -376,6 +399,7 @@ void SqliteStore::releaseStatements() {
   commit_ = {};
   retention_.release();
   runs_.release();
+  vacuum_.release();
   for (RecordKind* const kind : kinds_) kind->release();
 }
 

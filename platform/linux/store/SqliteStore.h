@@ -25,6 +25,7 @@
 #include "platform/linux/store/StoreFiles.h"
 #include "platform/linux/store/StoreOpening.h"
 #include "platform/linux/store/StoreRecords.h"
+#include "platform/linux/store/StoreVacuum.h"
 #include "platform/linux/store/WriterQueue.h"
 #include "platform/statistics.h"
 
@@ -96,6 +97,12 @@ class SqliteStore {
   // thread may call.
   [[nodiscard]] bool isBehind() const { return queue_.isBehind(); }
 
+  // Begins to delete on demand, between the transactions that store records. Returns false if a
+  // vacuum runs already, or if the store is closed. Any thread may call; does not block.
+  bool beginVacuum(const VacuumRequest& request);
+  // How the vacuum is getting on, or how the last one ended. Any thread may call.
+  [[nodiscard]] VacuumState vacuumState() { return vacuum_.state(); }
+
  private:
   using Time = WriterQueue::Time;
 
@@ -118,6 +125,7 @@ class SqliteStore {
   void drop(DropReason reason, std::string_view what);
   void onStored();
   void maintainWhileIdle();
+  void vacuumOnce();
   void releaseMemoryIfIdle();
   [[nodiscard]] bool maintainOnce();
   void closeDatabase();
@@ -146,6 +154,7 @@ class SqliteStore {
   Statement commit_;
   Retention retention_;
   ServiceRuns runs_;
+  StoreVacuum vacuum_;
   Time nextRound_{};
   std::uint64_t droppedSinceStored_ = 0;
   std::uint64_t bytesSinceRelease_ = 0;  // of payloads, since memory was last released

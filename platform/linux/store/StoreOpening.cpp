@@ -120,6 +120,12 @@ void abandon(Database& database) {
   database.close();
 }
 
+Result<void, StoreError> openIntactDatabase(StoreFiles& files, const StoreSizes& sizes,
+                                            Database& database) {
+  if (auto claimed = files.claimDirectory(); !claimed) return claimed;
+  return attempt(files, sizes, database);
+}
+
 Result<void, StoreError> openStoreDatabase(StoreFiles& files, const StoreSizes& sizes,
                                            Database& database) {
   if (auto claimed = files.claimDirectory(); !claimed) return claimed;

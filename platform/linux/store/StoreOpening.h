@@ -29,6 +29,11 @@ struct StoreSizes {
 Result<void, StoreError> openStoreDatabase(StoreFiles& files, const StoreSizes& sizes,
                                            Database& database);
 
+// Opens the database of a store that exists, as openStoreDatabase() does, but leaves a damaged one
+// as it is and fails with kDamaged.
+Result<void, StoreError> openIntactDatabase(StoreFiles& files, const StoreSizes& sizes,
+                                            Database& database);
+
 // Closes a database without copying its write-ahead log into it. Damaged files therefore stay as
 // they are and can be examined. Does nothing if the database is not open.
 void abandon(Database& database);
