@@ -246,6 +246,11 @@ class HalvoxConnection {
   /// Returns what the service has counted since its start: the number of each counter by "piece,
   /// name", such as "session, suppressed: redundant". A service of an earlier version refuses.
   Result<Dictionary> getCounters();
+  /// Begins to delete stored records: "before" (seconds since 1970) and "to" (bytes) say which.
+  /// Only root and the user that the service runs as may do this; others are refused.
+  Result<bool> beginVacuum(const Dictionary& options);
+  /// Returns how the vacuum is getting on, or how the last one ended. For the same users.
+  Result<Dictionary> vacuumState();
   /// Ends the service. The service does not answer this request. The result true means that the
   /// connection has ended. Only root and the user that the service runs as may do this; others are
   /// refused.

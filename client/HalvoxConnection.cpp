@@ -282,6 +282,16 @@ Result<Dictionary> HalvoxConnection::getCounters() {
   return readDictionary(impl_->ask(makeCountersRequest()));
 }
 
+Result<bool> HalvoxConnection::beginVacuum(const Dictionary& options) {
+  auto answer = impl_->ask(makeBeginVacuumRequest(options));
+  if (!answer) return failed<bool>(std::move(*answer.failure));
+  return {true, std::nullopt};
+}
+
+Result<Dictionary> HalvoxConnection::vacuumState() {
+  return readDictionary(impl_->ask(makeVacuumStateRequest()));
+}
+
 Result<std::vector<ReporterID>> HalvoxConnection::getAllReporters() {
   using IDs = std::vector<ReporterID>;
   auto answer = impl_->ask(makeRequest("getAllReporters"));

@@ -20,6 +20,7 @@ using dbus::HeaderField;
 constexpr std::string_view kObjectPath = "/com/tarno/halvox/reporting";
 constexpr std::string_view kInterface = "com.tarno.halvox.HVReportingServiceProtocol";
 constexpr std::string_view kStatisticsInterface = "com.tarno.halvox.Statistics";
+constexpr std::string_view kStorageInterface = "com.tarno.halvox.Storage";
 
 // ---- Headers
 
@@ -155,16 +156,24 @@ Request make(const Header& header, const Body& body) {
   return finish(writer, segments);
 }
 
-Request makeSetConfiguration(ReporterID id, const Dictionary& configuration) {
+// Makes a request whose body is a dictionary and what `appendRest` adds.
+template <typename Rest>
+Request makeWithDictionary(const Header& header, const Dictionary& dictionary,
+                           const Rest& appendRest) {
   std::string path;
   std::optional<std::string> error;
-  Request request = make(makeHeader("setConfiguration", "a{sv}x"), [&](SegmentWriter& writer) {
+  Request request = make(header, [&](SegmentWriter& writer) {
     ValueWriter values(writer, &path);
-    if (!values.append(configuration)) error = values.error();
-    writer.number(id);
+    if (!values.append(dictionary)) error = values.error();
+    appendRest(writer);
   });
   if (error) return badRequest(*error);
   return request;
+}
+
+Request makeSetConfiguration(ReporterID id, const Dictionary& configuration) {
+  return makeWithDictionary(makeHeader("setConfiguration", "a{sv}x"), configuration,
+                            [id](SegmentWriter& writer) { writer.number(id); });
 }
 
 Request makeSetServiceType(ReporterID id, ServiceType type) {
@@ -219,6 +228,15 @@ Request makeRequest(const char* member) {
 
 Request makeCountersRequest() {
   return make(makeHeader("GetCounters", "", kStatisticsInterface), [](SegmentWriter&) {});
+}
+
+Request makeBeginVacuumRequest(const Dictionary& options) {
+  return makeWithDictionary(makeHeader("BeginVacuum", "a{sv}", kStorageInterface), options,
+                            [](SegmentWriter&) {});
+}
+
+Request makeVacuumStateRequest() {
+  return make(makeHeader("GetVacuum", "", kStorageInterface), [](SegmentWriter&) {});
 }
 
 Request makeRequest(const char* member, ReporterID id) {

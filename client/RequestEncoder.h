@@ -53,6 +53,9 @@ Request makeRequest(const SessionOperation& operation);
 Request makeRequest(const MessageView& message);
 // The request for the service's counters, which has an interface of its own.
 Request makeCountersRequest();
+// The requests of the service's interface for its store.
+Request makeBeginVacuumRequest(const Dictionary& options);
+Request makeVacuumStateRequest();
 
 // Sets the serial of a frame. It must not be 0. At least the first 12 bytes of the frame must be at
 // `frame`.

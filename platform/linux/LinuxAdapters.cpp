@@ -1,12 +1,14 @@
 #include "platform/linux/LinuxAdapters.h"
 
 #include <filesystem>
+#include <string>
 #include <utility>
 #include <vector>
 
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/store/StoreVacuum.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -36,6 +38,33 @@ Dictionary readCounters(const CounterStatisticsService& statistics) {
     counters.add(reading.piece + ", " + reading.name, reading.value);
   }
   return counters;
+}
+
+// Runs on the I/O thread; the store outlives it.
+StorageControl storageControl(SqliteStore& store) {
+  const auto begin = [&store](const Dictionary& options) -> std::string {
+    VacuumRequest request;
+    for (const auto& [name, value] : options) {
+      if (name.text() == "before" && value.isNumber()) {
+        request.before = value.toDouble();
+      } else if (name.text() == "to" && value.isNumber()) {
+        request.toBytes = value.toUInt64();
+      } else {
+        return "expected the options \"before\" and \"to\" with numbers, found \"" +
+               std::string(name.text()) + '"';
+      }
+    }
+    return store.beginVacuum(request) ? "" : "a vacuum runs already; wait until it ends";
+  };
+  const auto state = [&store] {
+    const VacuumState now = store.vacuumState();
+    return Dictionary{{"running", now.isRunning},
+                      {"before", now.bytesBefore},
+                      {"bytes", now.bytes},
+                      {"log held", now.isLogHeld},
+                      {"problem", now.problem}};
+  };
+  return {.beginVacuum = begin, .vacuumState = state};
 }
 
 StoreOptions storeOptions(const Configuration& configuration) {
@@ -100,6 +129,7 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
             options.afterReplies = [this] { dispatch.wakePool(); };
             options.onReportSignal = std::move(onReportSignal);
             options.hasProgressed = [this] { return dispatch.hasProgressed(watchedQueue); };
+            options.storage = storageControl(store);
             options.counters = [this] { return readCounters(statistics); };
             return options;
           }(),

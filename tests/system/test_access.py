@@ -113,6 +113,38 @@ class EndingTheService(AccessTest):
 
 
 @unittest.skipIf(os.getuid() != 0, "needs the right to become another user")
+class DeletingRecords(AccessTest):
+    def vacuum(self, client):
+        client.call("BeginVacuum", "a{sv}", {}, interface="com.tarno.halvox.Storage")
+
+    def test_another_user_may_neither_delete_nor_look(self):
+        stranger = self.connect(self.system_service().start(), NOBODY)
+
+        with self.assertRaisesRegex(GLib.Error, f"{ACCESS_DENIED}.*uid {NOBODY}"):
+            self.vacuum(stranger)
+        with self.assertRaisesRegex(GLib.Error, ACCESS_DENIED):
+            stranger.call("GetVacuum", interface="com.tarno.halvox.Storage")
+
+    def test_the_command_says_why(self):
+        service = self.system_service().start()
+        vacuum = [*setpriv_to(NOBODY), self.copy(CTL), "--socket", str(service.socket), "vacuum", "--older", "1s"]
+
+        result = subprocess.run(vacuum, capture_output=True, text=True, timeout=harness.DEADLINE)
+
+        self.assertEqual(result.returncode, 1, result.stderr)
+        self.assertIn("only root and the service's own user", result.stderr)
+
+    def test_its_own_user_and_root_may(self):
+        service = self.system_service(user=NOBODY).start()
+
+        for user in (NOBODY, None):
+            client = self.connect(service, user)
+            self.vacuum(client)
+            harness.wait_for("its end", lambda: not client.call(
+                "GetVacuum", interface="com.tarno.halvox.Storage")["running"])
+
+
+@unittest.skipIf(os.getuid() != 0, "needs the right to become another user")
 class EndingTheServiceOverABus(AccessTest):
     @classmethod
     def setUpClass(cls):

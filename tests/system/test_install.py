@@ -97,6 +97,7 @@ class SystemFilesTest(Installation):
                      "share/dbus-1/system-services/com.tarno.halvox.reporting.service",
                      f"share/dbus-1/interfaces/{INTERFACE}.xml",
                      "share/dbus-1/interfaces/com.tarno.halvox.Statistics.xml",
+                     "share/dbus-1/interfaces/com.tarno.halvox.Storage.xml",
                      "share/bash-completion/completions/halvoxctl",
                      "share/zsh/vendor-completions/_halvoxctl", "share/fish/vendor_completions.d/halvoxctl.fish",
                      "share/man/man1/halvoxctl.1",
@@ -130,7 +131,7 @@ class SystemFilesTest(Installation):
 class InterfaceFileTest(Installation):
     """The interface files, which have names and comments, and the service's own answer agree."""
 
-    INTERFACES = (INTERFACE, "com.tarno.halvox.Statistics")
+    INTERFACES = (INTERFACE, "com.tarno.halvox.Statistics", "com.tarno.halvox.Storage")
 
     def file(self, interface=INTERFACE):
         return self.prefix / f"share/dbus-1/interfaces/{interface}.xml"

@@ -15,6 +15,7 @@
 #include "platform/linux/configuration/Defaults.h"
 #include "platform/linux/connection/BusAddress.h"
 #include "platform/linux/connection/ConnectionLimits.h"
+#include "platform/linux/connection/StorageControl.h"
 #include "platform/linux/dispatch/Backpressure.h"
 #include "platform/value.h"
 
@@ -70,6 +71,7 @@ struct ConnectionOptions {
   // Called on the I/O thread for each client that asks for the counters. Returns the value of each
   // counter by "piece, name". Without it the service answers with no counters.
   std::function<Dictionary()> counters;
+  StorageControl storage{};
 };
 
 // Why open() failed. The message of the failure is one line for the user.

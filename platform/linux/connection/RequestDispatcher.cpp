@@ -74,7 +74,9 @@ struct RequestDispatcher::Request {
 RequestDispatcher::RequestDispatcher(const ConnectionOptions& options,
                                      ConnectionStatistics& statistics,
                                      const ServiceIdentity& identity)
-    : options_(options), statistics_(statistics), standard_(identity, options.counters) {
+    : options_(options),
+      statistics_(statistics),
+      standard_(identity, options.counters, options.storage) {
   scratch_.caches = std::make_unique<dbus::DecodeCaches>();
 }
 
@@ -106,7 +108,7 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
 
 void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& method) {
   // Check rights and limits before decoding the body. A refused request then needs no decoding.
-  if (method.access == MethodAccess::kOwner && isForbidden(request, method)) return;
+  if (method.access == MethodAccess::kOwner && isForbidden(request, method.name)) return;
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
   scratch_.addedEntries = method.addedEntries;
   if (!decode(request, method.in)) return;
@@ -147,7 +149,7 @@ void RequestDispatcher::post(const Request& request, const InterfaceMethod& meth
   arguments_.clear();
 }
 
-bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMethod& method) {
+bool RequestDispatcher::isForbidden(const Request& request, std::string_view method) {
   constexpr uid_t kRoot = 0;
   const uid_t owner = geteuid();
   const uid_t user = request.client.credentials().uid;
@@ -156,7 +158,7 @@ bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMetho
   if (user != kUnknownUser && (user == owner || user == kRoot)) return false;
   const std::string who = user == kUnknownUser ? "an unknown user" : "uid " + std::to_string(user);
   request.client.refuse(request.header(), Refusal::kNotAllowed, error_names::kAccessDenied,
-                        quoted(method.name) + ": only root and the service's own user (uid " +
+                        quoted(method) + ": only root and the service's own user (uid " +
                             std::to_string(owner) + ") may call this; the client is " + who);
   return true;
 }
@@ -199,6 +201,7 @@ bool RequestDispatcher::namesTooManyReporters(const Request& request,
 }
 
 void RequestDispatcher::answerStandard(const Request& request, const StandardMethod& method) {
+  if (method.access == MethodAccess::kOwner && isForbidden(request, method.name)) return;
   scratch_.addedEntries = 0;
   if (!decode(request, method.in)) return;
   statistics_.requestsAnsweredHere.add();
@@ -207,7 +210,8 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
                                                .path = header.path,
                                                .arguments = arguments_,
                                                .identity = standard_.identity(),
-                                               .counters = standard_.counters()});
+                                               .counters = standard_.counters(),
+                                               .storage = standard_.storage()});
   arguments_.clear();
   if (isAnswerUnwanted(header)) return;
   statistics_.repliesGiven.add();

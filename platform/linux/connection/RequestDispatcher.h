@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <string_view>
 #include <vector>
 
 #include "platform/connection.h"
@@ -33,7 +34,7 @@ class RequestDispatcher {
 
   void deliver(const Request& request, const InterfaceMethod& method);
   void post(const Request& request, const InterfaceMethod& method, FlowControl::Cost cost);
-  [[nodiscard]] bool isForbidden(const Request& request, const InterfaceMethod& method);
+  [[nodiscard]] bool isForbidden(const Request& request, std::string_view method);
   [[nodiscard]] bool isOverLimits(const Request& request, const InterfaceMethod& method);
   [[nodiscard]] bool namesTooManyReporters(const Request& request, const InterfaceMethod& method);
   void answerStandard(const Request& request, const StandardMethod& method);

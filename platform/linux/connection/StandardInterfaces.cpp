@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <utility>
 
 #include "platform/linux/connection/ClientConnection.h"
 #include "platform/linux/connection/ErrorNames.h"
@@ -14,6 +15,7 @@ constexpr std::string_view kPeer = "org.freedesktop.DBus.Peer";
 constexpr std::string_view kIntrospectable = "org.freedesktop.DBus.Introspectable";
 constexpr std::string_view kProperties = "org.freedesktop.DBus.Properties";
 constexpr std::string_view kStatistics = "com.tarno.halvox.Statistics";
+constexpr std::string_view kStorage = "com.tarno.halvox.Storage";
 
 StandardAnswer ping(const StandardRequest& /*request*/) { return {}; }
 
@@ -44,6 +46,18 @@ StandardAnswer getCounters(const StandardRequest& request) {
   return {.value = Value(request.counters ? request.counters() : Dictionary{})};
 }
 
+StandardAnswer beginVacuum(const StandardRequest& request) {
+  const auto& begin = request.storage.beginVacuum;
+  std::string problem = begin ? begin(request.arguments[0].dictionary()) : "there is no store";
+  if (problem.empty()) return {};
+  return {.errorName = error_names::kFailed, .errorText = std::move(problem)};
+}
+
+StandardAnswer getVacuum(const StandardRequest& request) {
+  const auto& state = request.storage.vacuumState;
+  return {.value = Value(state ? state() : Dictionary{})};
+}
+
 // Keep the methods of one interface together, because the introspection writes one interface
 // element for each run of methods with the same interface.
 //
@@ -56,6 +70,10 @@ constexpr std::array kObjectMethods = {
     StandardMethod{kProperties, "GetAll", "s", "a{sv}", StandardScope::kObject, noProperties},
     StandardMethod{kProperties, "Set", "ssv", "", StandardScope::kObject, unknownProperty},
     StandardMethod{kStatistics, "GetCounters", "", "a{sv}", StandardScope::kObject, getCounters},
+    StandardMethod{kStorage, "BeginVacuum", "a{sv}", "", StandardScope::kObject, beginVacuum,
+                   MethodAccess::kOwner},
+    StandardMethod{kStorage, "GetVacuum", "", "a{sv}", StandardScope::kObject, getVacuum,
+                   MethodAccess::kOwner},
 };
 
 bool isExportedObject(const ClientConnection& client, std::string_view path) {

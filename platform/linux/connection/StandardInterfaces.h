@@ -6,6 +6,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/connection.h"
+#include "platform/linux/connection/StorageControl.h"
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/value.h"
 
@@ -37,6 +39,7 @@ struct StandardRequest {
   std::span<const Value> arguments;
   const ServiceIdentity& identity;
   const CounterReader& counters;
+  const StorageControl& storage;
 };
 
 // Which objects have a standard method.
@@ -54,6 +57,7 @@ struct StandardMethod {
   std::string_view out;
   StandardScope scope = StandardScope::kEverywhere;
   StandardAnswer (*answer)(const StandardRequest& request) = nullptr;
+  MethodAccess access = MethodAccess::kAnybody;
 };
 
 // The methods that the adapter answers itself.
@@ -67,15 +71,17 @@ enum class UnknownPart : std::uint8_t { kObject, kInterface, kMethod };
 // Client libraries make a few calls to the bus. For clients on our own socket, which has no bus,
 // the adapter answers these calls, too, and the libraries then work unchanged.
 //
-// One interface is our own: com.tarno.halvox.Statistics, whose GetCounters answers what the service
-// has counted since its start. It is not part of the exported object, because the counters belong
-// to the platform and not to the protocol.
+// Two interfaces are our own: com.tarno.halvox.Statistics, whose GetCounters answers what the
+// service has counted since its start, and com.tarno.halvox.Storage, which deletes stored records.
+// They are not part of the exported object, because counters and store belong to the platform and
+// not to the protocol.
 //
 // Belongs to the I/O thread. Owned by the dispatcher. Does not own its arguments.
 class StandardInterfaces {
  public:
-  StandardInterfaces(const ServiceIdentity& identity, const CounterReader& counters)
-      : identity_(identity), counters_(counters) {}
+  StandardInterfaces(const ServiceIdentity& identity, const CounterReader& counters,
+                     const StorageControl& storage)
+      : identity_(identity), counters_(counters), storage_(storage) {}
 
   // Returns the standard method that a request asks for, or null if it asks for none.
   [[nodiscard]] const StandardMethod* find(const ClientConnection& client,
@@ -86,10 +92,12 @@ class StandardInterfaces {
                                           const dbus::MessageHeader& request) const;
   [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }
   [[nodiscard]] const CounterReader& counters() const { return counters_; }
+  [[nodiscard]] const StorageControl& storage() const { return storage_; }
 
  private:
   const ServiceIdentity& identity_;
   const CounterReader& counters_;
+  const StorageControl& storage_;
 };
 
 // Returns true if `path` is a parent of `objectPath`. The root is a parent of all others.

@@ -23,6 +23,7 @@ constexpr const char* kBus = "org.freedesktop.DBus";
 constexpr const char* kBusPath = "/org/freedesktop/DBus";
 constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
 constexpr const char* kStatistics = "com.tarno.halvox.Statistics";
+constexpr const char* kStorage = "com.tarno.halvox.Storage";
 constexpr const char* kServiceName = "com.tarno.halvox.reporting";
 
 // Returns what a command prints on its standard output and standard error. Only for the test's own
@@ -122,6 +123,40 @@ TEST(StandardInterfacesTest, AServiceThatReadsNoCountersAnswersWithNone) {
   BusClient client(service.address());
 
   EXPECT_EQ(client.callAt(kTestPath, kStatistics, "GetCounters").errorName, "");
+}
+
+// Calls BeginVacuum with the option "to". Returns the message of the error, or an empty text.
+std::string beginVacuum(const BusClient& client, std::uint64_t bytes) {
+  sd_bus_error error = SD_BUS_ERROR_NULL;
+  const int result =
+      sd_bus_call_method(client.get(), kServiceName, kTestPath, kStorage, "BeginVacuum", &error,
+                         nullptr, "a{sv}", 1, "to", "t", bytes);
+  std::string message = result < 0 && error.message != nullptr ? error.message : "";
+  sd_bus_error_free(&error);
+  return message;
+}
+
+TEST(StandardInterfacesTest, TheStoreGetsTheOptionsOfAVacuum) {
+  std::uint64_t wanted = 0;
+  const ServiceUnderTest service([&](ConnectionOptions& options) {
+    options.storage.beginVacuum = [&wanted](const Dictionary& given) {
+      wanted = given.find("to")->toUInt64();
+      return std::string(wanted > 5 ? "" : "too small");
+    };
+  });
+  const BusClient client(service.address());
+
+  EXPECT_EQ(beginVacuum(client, 7), "");
+  EXPECT_EQ(wanted, 7U);
+  EXPECT_EQ(beginVacuum(client, 5), "too small");
+}
+
+TEST(StandardInterfacesTest, WithoutAStoreThereIsNoVacuum) {
+  const ServiceUnderTest service;
+  BusClient client(service.address());
+
+  EXPECT_EQ(beginVacuum(client, 7), "there is no store");
+  EXPECT_EQ(client.callAt(kTestPath, kStorage, "GetVacuum").errorName, "");
 }
 
 TEST(StandardInterfacesTest, EveryPeerGetsAUniqueNameOnce) {
