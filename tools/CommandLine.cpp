@@ -45,6 +45,7 @@ constexpr CommandGroup kGroups[] = {
     {"What the service stored", addQueryCommands, GroupPlace::kArguments},
     {"What the service stored", addExportCommand, GroupPlace::kArguments},
     {"What the service stored", addVerifyCommand, GroupPlace::kArguments},
+    {"What the service stored", addStorageCommands, GroupPlace::kArguments},
     {"Traces and drivers", addTraceCommands, GroupPlace::kArguments},
     {"Traces and drivers", addDriverCommand, GroupPlace::kArguments},
     {"Settings", addSettingsCommands, GroupPlace::kArguments},
