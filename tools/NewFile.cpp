@@ -39,11 +39,14 @@ NewFile::~NewFile() {
   if (hasName_) ::unlink(path_.c_str());
 }
 
+// If the file could not be created, sets errno to the reason and returns false.
+bool NewFile::isCreated() const {
+  if (!descriptor_) errno = error_;
+  return static_cast<bool>(descriptor_);
+}
+
 bool NewFile::append(std::string_view text) {
-  if (!descriptor_) {
-    errno = error_;
-    return false;
-  }
+  if (!isCreated()) return false;
   while (!text.empty()) {
     const ssize_t count = ::write(descriptor_.get(), text.data(), text.size());
     if (count < 0 && errno == EINTR) continue;
@@ -55,7 +58,7 @@ bool NewFile::append(std::string_view text) {
 
 bool NewFile::complete(mode_t mode) {
   // Without this fsync(), a crash after the rename could leave an empty file.
-  return ::fchmod(descriptor_.get(), mode) == 0 && ::fsync(descriptor_.get()) == 0;
+  return isCreated() && ::fchmod(descriptor_.get(), mode) == 0 && ::fsync(descriptor_.get()) == 0;
 }
 
 bool NewFile::write(std::string_view text, mode_t mode) { return append(text) && complete(mode); }

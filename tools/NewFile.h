@@ -26,7 +26,7 @@ class NewFile {
   NewFile& operator=(const NewFile&) = delete;
   ~NewFile();
 
-  // Appends to the file. A failure to create the file shows here.
+  // Appends to the file. A failure to create the file shows here, or in complete().
   [[nodiscard]] bool append(std::string_view text);
   // Sets the mode, and waits until the whole file is on the disk.
   [[nodiscard]] bool complete(mode_t mode);
@@ -37,6 +37,7 @@ class NewFile {
                             Existing existing = Existing::kReplaced);
 
  private:
+  [[nodiscard]] bool isCreated() const;
   [[nodiscard]] bool makeNamed();
 
   std::string path_;  // the temporary name, once it is used

@@ -68,6 +68,9 @@ TEST_F(NewFileTest, ADirectoryThatDoesNotExistIsAnError) {
   NewFile file("/nowhere/records");
   EXPECT_FALSE(file.write("x", 0644));
   EXPECT_EQ(errno, ENOENT);
+  errno = 0;
+  EXPECT_FALSE(file.complete(0644)) << "although nothing was written";
+  EXPECT_EQ(errno, ENOENT);
 }
 
 }  // namespace

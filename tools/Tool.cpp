@@ -23,7 +23,7 @@ ExitStatus runTool(std::vector<std::string> arguments, const std::string& versio
     status = std::get<Command>(parsed).run(streams);
   }
   // A full disk may show only here, after everything was printed.
-  if (!streams.output.flush()) {
+  if (!streams.output.flush() && status != ExitStatus::kCannotWrite) {
     streams.errors << "halvoxctl: the output cannot be written\n";
     return status == ExitStatus::kDone ? ExitStatus::kCannotWrite : status;
   }

@@ -10,7 +10,7 @@ import subprocess
 import tempfile
 import time
 
-from harness import DEADLINE, WITH_US, stop_process
+from harness import DEADLINE, WITH_US, stop_process, wait_for
 
 # Everything that can share a process does, because two processors serve all tests. There is no
 # sandbox, because it needs rights that a container does not give. The other options keep Chromium
@@ -144,11 +144,22 @@ class Browser:
                       **({"text": "\r"} if key == "Enter" and kind == "keyDown" else {}))
 
     def screenshot(self, path, whole=True):
+        if whole:
+            self._draw_all_pictures()
         self.frames()
         picture = self.call("Page.captureScreenshot", format="png", captureBeyondViewport=whole,
                             **({"clip": self._whole_page()} if whole else {}))
         with open(path, "wb") as file:
             file.write(base64.b64decode(picture["data"]))
+
+    def _draw_all_pictures(self):
+        """The page draws a picture when it comes near the screen."""
+        count = self.evaluate("document.querySelectorAll('.frame').length")
+        for number in range(count):
+            frame = f"document.querySelectorAll('.frame')[{number}]"
+            self.evaluate(frame + ".scrollIntoView()")
+            wait_for("the picture", lambda: (self.frames(), self.evaluate(frame + ".childElementCount"))[1])
+        self.evaluate("scrollTo(0, 0)")
 
     def _whole_page(self):
         size = self.call("Page.getLayoutMetrics")["cssContentSize"]

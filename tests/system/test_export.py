@@ -282,7 +282,8 @@ class ExportTest(ExportTestCase):
                                     stderr=subprocess.PIPE, check=False, timeout=DEADLINE,
                                     env=self.environment())
         self.assertEqual(result.returncode, 74)
-        self.assertIn(b"cannot be written", result.stderr)
+        self.assertEqual(result.stderr.splitlines(),
+                         [b"halvoxctl export: the standard output cannot be written"])
 
     def test_a_reader_that_goes_away_ends_it(self):
         process = subprocess.Popen([*WITH_US, CTL, "export", "--format", "csv", "-o", "/dev/stdout"],
