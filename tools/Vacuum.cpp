@@ -180,10 +180,14 @@ platform::linux_::Result<std::uint64_t> parseBytes(std::string_view text) {
   const std::size_t power = unit.empty() ? 0 : kUnits.find(unit) + 1;
   const unsigned bits = static_cast<unsigned>(power) * kBitsPerUnit;
   const bool isUnit = unit.empty() || (unit.size() == 1 && power > 0);
-  if (read.ec != std::errc() || !isUnit || number == 0 ||
+  if (read.ec != std::errc() || !isUnit ||
       number > std::numeric_limits<std::uint64_t>::max() >> bits) {
     return Failure<>{"\"" + std::string(text) +
-                     "\" is not a size; expected a number of bytes of 1 or more, such as 100M"};
+                     "\" is not a size; expected a number of bytes, such as 100M"};
+  }
+  // Somebody who leaves out the unit does not mean to delete nearly everything.
+  if (number << bits < platform::linux_::kLeastVacuumBytes) {
+    return Failure<>{"\"" + std::string(text) + "\" is too small; expected at least 1M"};
   }
   return number << bits;
 }

@@ -54,6 +54,9 @@ StorageControl storageControl(SqliteStore& store) {
                std::string(name.text()) + '"';
       }
     }
+    if (request.toBytes.value_or(kLeastVacuumBytes) < kLeastVacuumBytes) {
+      return "\"to\" must be at least " + std::to_string(kLeastVacuumBytes);
+    }
     return store.beginVacuum(request) ? "" : "a vacuum runs already; wait until it ends";
   };
   const auto state = [&store] {

@@ -64,12 +64,16 @@ class VacuumTest(unittest.TestCase):
 
     def test_messages_that_come_meanwhile_are_all_stored(self):
         service, client = self.started(1500)
-        vacuum = threading.Thread(target=service.ctl, args=("vacuum", "--to", "1M"))
+        done = []
+        vacuum = threading.Thread(target=lambda: done.append(service.ctl("vacuum", "--to", "1M")))
         vacuum.start()
         for number in range(5000, 5200):
             client.send({"number": number}, reporters=[7])
         vacuum.join()
 
+        self.assertEqual(len(done), 1, "the vacuum failed")
+        self.assertIn("a vacuum begins", service.log())
+        self.assertIn("the vacuum has ended", service.log())
         wait_for("the messages", lambda: count(service, "payload ->> 'number' >= 5000") == 200)
 
     def test_without_a_service_halvoxctl_does_it(self):
@@ -96,8 +100,10 @@ class VacuumTest(unittest.TestCase):
         for arguments in ([], ["--to", "much"], ["--older", "2999-01-01"]):
             with self.subTest(arguments=arguments):
                 service.ctl("vacuum", *arguments, status=2)
-        with self.assertRaisesRegex(Exception, "expected the options"):
-            client.call("BeginVacuum", "a{sv}", variants({"olderr": 1}), interface=STORAGE)
+        for options, complaint in (({"olderr": 1}, "expected the options"),
+                                   ({"to": 100}, "must be at least 1048576")):
+            with self.assertRaisesRegex(Exception, complaint):
+                client.call("BeginVacuum", "a{sv}", variants(options), interface=STORAGE)
 
 
 if __name__ == "__main__":

@@ -356,6 +356,8 @@ bool SqliteStore::maintainOnce() {
 
 bool SqliteStore::beginVacuum(const VacuumRequest& request) {
   if (!vacuum_.begin(request)) return false;
+  kLog.notice("a vacuum begins; the database and its log have ", vacuum_.state().bytesBefore,
+              " bytes");
   queue_.requestRound();
   return true;
 }
@@ -368,10 +370,12 @@ void SqliteStore::vacuumOnce() {
   errno = 0;
   const SqliteCode code = vacuum_.runOnce(database_, kinds_);
   if (code != SQLITE_OK) {
-    vacuum_.fail(database_.errorText());
+    vacuum_.fail(sqlite3_errstr(code));
     return fail(code, "cannot vacuum the database");
   }
-  if (vacuum_.isRunning()) queue_.requestRound();
+  if (vacuum_.isRunning()) return queue_.requestRound();
+  kLog.notice("the vacuum has ended; the database and its log have ", vacuum_.state().bytes,
+              " bytes");
 }
 
 void SqliteStore::closeDatabase() {

@@ -92,10 +92,10 @@ Failure<StoreError> cannotVacuum(const std::filesystem::path& file, const std::s
 }  // namespace
 
 bool StoreVacuum::begin(const VacuumRequest& request) {
+  const std::uint64_t bytes = bytesOf(database_);
   const MutexLock lock(mutex_);
   if (state_.isRunning || isCancelled_) return false;
   request_ = request;
-  const std::uint64_t bytes = bytesOf(database_);
   state_ = {.isRunning = true, .bytesBefore = bytes, .bytes = bytes};
   return true;
 }
@@ -130,8 +130,7 @@ SqliteCode StoreVacuum::runOnce(Database& database, std::span<RecordKind* const>
     code = shrink(database, more);
   }
   noteBytes();
-  if (code == SQLITE_OK && !more) finish(database);
-  return code;
+  return code == SQLITE_OK && !more ? finish(database) : code;
 }
 
 SqliteCode StoreVacuum::prepare(Database& database) {
@@ -166,16 +165,19 @@ SqliteCode StoreVacuum::shrink(Database& database, bool& more) {
   return code;
 }
 
-void StoreVacuum::finish(Database& database) {
+SqliteCode StoreVacuum::finish(Database& database) {
   release();
   // Copy the log into the database, which becomes shorter only now, and empty the log. If a reader
   // needs an older state, SQLite does this after a later transaction.
   const SqliteCode code = sqlite3_wal_checkpoint_v2(database.get(), nullptr,
                                                     SQLITE_CHECKPOINT_TRUNCATE, nullptr, nullptr);
+  const bool isHeld = code == SQLITE_BUSY || code == SQLITE_LOCKED;
+  if (code != SQLITE_OK && !isHeld) return code;
+  noteBytes();
   const MutexLock lock(mutex_);
-  state_.isLogHeld = code != SQLITE_OK;
-  state_.bytes = bytesOf(database_);
+  state_.isLogHeld = isHeld;
   state_.isRunning = false;
+  return SQLITE_OK;
 }
 
 void StoreVacuum::noteBytes() {
@@ -222,9 +224,8 @@ Result<VacuumState, StoreError> vacuumStore(
     if (progress) progress(vacuum.state());
   }
   vacuum.release();
-  const std::string problem = code == SQLITE_OK ? "" : database.errorText();
   for (RecordKind* const kind : kinds.all) kind->release();
-  if (code != SQLITE_OK) return cannotVacuum(files.database(), problem);
+  if (code != SQLITE_OK) return cannotVacuum(files.database(), sqlite3_errstr(code));
   return vacuum.state();
 }
 

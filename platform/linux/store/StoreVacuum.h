@@ -18,6 +18,9 @@
 
 namespace halvox::platform::linux_ {
 
+// The least size that a request from outside may name, in bytes. An empty database is smaller.
+constexpr std::uint64_t kLeastVacuumBytes = std::uint64_t{1} << 20U;
+
 // What to delete on demand. With neither limit, only free pages are given back.
 struct VacuumRequest {
   std::optional<double> before{};          // delete older records; seconds since 1970
@@ -51,8 +54,8 @@ class StoreVacuum {
   [[nodiscard]] VacuumState state() HALVOX_EXCLUDES(mutex_);
 
   [[nodiscard]] bool isRunning() HALVOX_EXCLUDES(mutex_);
-  // Carries out one step, or returns at once if no vacuum runs. After an
-  // error the caller rolls back and calls fail().
+  // Carries out one step, or returns at once if no vacuum runs. After an error the caller calls
+  // fail(). The database's own error text is then that of the rollback.
   [[nodiscard]] SqliteCode runOnce(Database& database, std::span<RecordKind* const> kinds)
       HALVOX_EXCLUDES(mutex_);
   // Ends the vacuum that runs, with a problem.
@@ -71,7 +74,7 @@ class StoreVacuum {
 
   [[nodiscard]] SqliteCode prepare(Database& database);
   [[nodiscard]] SqliteCode shrink(Database& database, bool& more);
-  void finish(Database& database) HALVOX_EXCLUDES(mutex_);
+  [[nodiscard]] SqliteCode finish(Database& database) HALVOX_EXCLUDES(mutex_);
   void noteBytes() HALVOX_EXCLUDES(mutex_);
 
   const std::filesystem::path database_;
