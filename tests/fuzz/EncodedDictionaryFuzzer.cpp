@@ -20,6 +20,7 @@
 #include "platform/linux/base/Utf8.h"
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/linux/connection/wire/ValueDecoder.h"
+#include "tests/fuzz/InputBytes.h"
 
 namespace halvox::client {
 namespace {
@@ -39,17 +40,10 @@ void require(bool condition) {
 }
 
 // The input as a sequence of numbers and texts; zeros after its end.
-class Input {
+class Input : public fuzzing::InputBytes {
  public:
-  explicit Input(std::span<const std::uint8_t> bytes) : rest_(bytes) {}
+  using InputBytes::InputBytes;
 
-  [[nodiscard]] bool isEmpty() const { return rest_.empty(); }
-  std::uint8_t byte() {
-    if (rest_.empty()) return 0;
-    const std::uint8_t first = rest_.front();
-    rest_ = rest_.subspan(1);
-    return first;
-  }
   std::size_t below(std::size_t end) { return byte() % end; }
   template <typename Number>
   Number number() {
@@ -65,14 +59,11 @@ class Input {
     const std::uint8_t length = byte();
     if (length < 128) return std::string(length % 20, static_cast<char>('a' + length % 3));
     std::string made;
-    for (std::size_t size = length % 80; size > 0 && !rest_.empty(); --size) {
+    for (std::size_t size = length % 80; size > 0 && !isEmpty(); --size) {
       made += static_cast<char>(byte());
     }
     return made;
   }
-
- private:
-  std::span<const std::uint8_t> rest_;
 };
 
 std::span<const std::byte> bytesOf(const std::string& text) {

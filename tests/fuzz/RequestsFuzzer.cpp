@@ -20,6 +20,7 @@
 #include "platform/linux/connection/wire/ValueDecoder.h"
 #include "service/HVReportingServiceDelegate.h"
 #include "service/HVReportingServiceProtocol.h"
+#include "tests/fuzz/InputBytes.h"
 #include "tests/fuzz/InputFile.h"
 
 namespace halvox {
@@ -28,27 +29,14 @@ namespace {
 using fuzzing::require;
 using platform::Value;
 
-// Gives out the bytes of a run from the front.
-class Bytes {
+class Bytes : public fuzzing::InputBytes {
  public:
-  explicit Bytes(std::span<const std::uint8_t> bytes) : rest_(bytes) {}
+  using InputBytes::InputBytes;
 
-  [[nodiscard]] bool isEmpty() const { return rest_.empty(); }
-  std::uint8_t byte() {
-    if (rest_.empty()) return 0;
-    const std::uint8_t first = rest_.front();
-    rest_ = rest_.subspan(1);
-    return first;
-  }
   std::span<const std::byte> block() {
     const std::size_t length = byte() | std::size_t{byte()} << 8U;
-    const auto result = std::as_bytes(rest_.first(std::min(length, rest_.size())));
-    rest_ = rest_.subspan(result.size());
-    return result;
+    return std::as_bytes(take(length));
   }
-
- private:
-  std::span<const std::uint8_t> rest_;
 };
 
 // Sessions have few numbers, so that the requests of a run are about the same ones.

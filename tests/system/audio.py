@@ -1,5 +1,6 @@
 """A private PipeWire with WirePlumber and a null sink, and the reporter that follows it."""
 
+import contextlib
 import itertools
 import json
 import math
@@ -8,10 +9,11 @@ import shutil
 import struct
 import subprocess
 import tempfile
+import unittest
 import wave
 from pathlib import Path
 
-from harness import BIN, stop_process, voluntary_switches, wait_for
+from harness import BIN, Service, stop_process, voluntary_switches, wait_for
 
 REPORTER = BIN / "halvox-pipewire-reporter"
 AUDIO_CLIENT = BIN / "halvox_audio_client"
@@ -190,3 +192,20 @@ class Reporter:
 
     def voluntary_switches(self):
         return voluntary_switches(self.process)
+
+
+class ReporterTestCase(unittest.TestCase):
+    """A service, a private PipeWire and the reporter between them."""
+
+    def setUp(self):
+        stack = contextlib.ExitStack()
+        self.addCleanup(stack.close)
+        self.service = stack.enter_context(Service())
+        self.audio = stack.enter_context(Audio())
+        self.reporter = stack.enter_context(Reporter(self.audio, self.service))
+        self.stack = stack
+
+    def play(self, *arguments, **options):
+        player = self.audio.play(*arguments, **options)
+        self.stack.callback(stop_process, player)
+        return player

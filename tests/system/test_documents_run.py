@@ -92,6 +92,10 @@ class DocumentsTest(DocumentRunner, Installation):
             copy = shutil.copytree if source.is_dir() else shutil.copy
             copy(source, self.world.home / source.name)
 
+    def test_a_configuration_with_a_mistake_fails(self):
+        with self.assertRaisesRegex(AssertionError, "sokcet"):
+            self.run_toml('[listener]\nsokcet = "x"\n', None)
+
 
 def add_tests():
     for path in documents.documents():

@@ -1,12 +1,11 @@
 """Real streams of a private PipeWire, from the application to the service's store."""
 
-import contextlib
 import signal
 import time
 import unittest
 
 import audio
-from harness import Service, stop_process, wait_for
+from harness import stop_process, wait_for
 
 
 def message(events, name):
@@ -15,20 +14,7 @@ def message(events, name):
 
 
 @unittest.skipIf(audio.missing(), audio.missing())
-class RealAudioTest(unittest.TestCase):
-    def setUp(self):
-        stack = contextlib.ExitStack()
-        self.addCleanup(stack.close)
-        self.service = stack.enter_context(Service())
-        self.audio = stack.enter_context(audio.Audio())
-        self.reporter = stack.enter_context(audio.Reporter(self.audio, self.service))
-        self.stack = stack
-
-    def play(self, *arguments, **options):
-        player = self.audio.play(*arguments, **options)
-        self.stack.callback(stop_process, player)
-        return player
-
+class RealAudioTest(audio.ReporterTestCase):
     def wait_for_message(self, name, count=1):
         return wait_for(f"{count} of {name} in the store", lambda: (
             found := message(self.service.events(), name)) and len(found) >= count and found)

@@ -1,6 +1,5 @@
 """halvoxctl streams: what the store says of sessions of the real service, and of real audio."""
 
-import contextlib
 import json
 import re
 import signal
@@ -205,23 +204,10 @@ class StreamsTest(unittest.TestCase):
 
 
 @unittest.skipIf(audio.missing(), audio.missing())
-class RealStreamsTest(unittest.TestCase):
-    def setUp(self):
-        stack = contextlib.ExitStack()
-        self.addCleanup(stack.close)
-        self.service = stack.enter_context(Service())
-        self.audio = stack.enter_context(audio.Audio())
-        self.reporter = stack.enter_context(audio.Reporter(self.audio, self.service))
-        self.stack = stack
-
+class RealStreamsTest(audio.ReporterTestCase):
     def streams(self):
         result = self.service.ctl("streams", "--json")
         return [json.loads(line) for line in result.stdout.splitlines()]
-
-    def play(self, *arguments, **options):
-        player = self.audio.play(*arguments, **options)
-        self.stack.callback(stop_process, player)
-        return player
 
     def wait_for(self, what, condition):
         return wait_for(what, lambda: self.service.database.exists()

@@ -15,18 +15,6 @@ constexpr double kNow = 1'700'000'000;
 
 class RetentionTest : public StoreFixture {
  protected:
-  void sendAt(double time, std::int64_t number) {
-    platform.clock.setCurrentDate({time});
-    send(number);
-  }
-  // Sends events of about 500 bytes.
-  void sendLong(std::int64_t count) {
-    for (std::int64_t number = 0; number < count; ++number) {
-      service->sendAnalyticsEventLazy("long", [number] {
-        return Dictionary{{"n", number}, {"f", noise(static_cast<std::uint64_t>(number), 480)}};
-      });
-    }
-  }
   [[nodiscard]] std::uintmax_t bytesOnDisk() const {
     std::uintmax_t bytes = 0;
     for (const char* suffix : {"", "-wal"}) {

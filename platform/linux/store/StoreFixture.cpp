@@ -63,6 +63,19 @@ void StoreFixture::send(std::int64_t number, const std::string& name) {
   service->sendAnalyticsEventLazy(name, [number] { return Dictionary{{"number", number}}; });
 }
 
+void StoreFixture::sendAt(double time, std::int64_t number) {
+  platform.clock.setCurrentDate({time});
+  send(number);
+}
+
+void StoreFixture::sendLong(std::int64_t count) {
+  for (std::int64_t number = 0; number < count; ++number) {
+    service->sendAnalyticsEventLazy("long", [number] {
+      return Dictionary{{"n", number}, {"f", noise(static_cast<std::uint64_t>(number), 480)}};
+    });
+  }
+}
+
 bool StoreFixture::allIsStored() {
   return eventually([this] { return store->waiting() == 0; });
 }

@@ -45,6 +45,10 @@ class StoreFixture : public ::testing::Test {
 
   // Sends an event whose payload is {"number": number}.
   void send(std::int64_t number, const std::string& name = "com.tarno.test");
+  // The same at that time, in seconds since 1970.
+  void sendAt(double time, std::int64_t number);
+  // Sends events of about 500 bytes.
+  void sendLong(std::int64_t count);
   [[nodiscard]] bool allIsStored();
   [[nodiscard]] std::filesystem::path database() const { return options.directory / "halvox.db"; }
   // The payloads of the events that tests send, without those of the store itself.

@@ -20,18 +20,6 @@ constexpr std::uint64_t kMebibyte = std::uint64_t{1024} * 1024;
 
 class StoreVacuumTest : public StoreFixture {
  protected:
-  void sendAt(double time, std::int64_t number) {
-    platform.clock.setCurrentDate({time});
-    send(number);
-  }
-  // Sends events of about 500 bytes.
-  void sendLong(std::int64_t count) {
-    for (std::int64_t number = 0; number < count; ++number) {
-      service->sendAnalyticsEventLazy("long", [number] {
-        return Dictionary{{"n", number}, {"f", noise(static_cast<std::uint64_t>(number), 480)}};
-      });
-    }
-  }
   // Vacuums the open store and waits for the end.
   VacuumState vacuum(const VacuumRequest& request) {
     EXPECT_TRUE(allIsStored());
