@@ -74,7 +74,6 @@ SqliteCode Retention::prepare(Database& database) {
   for (const auto& [statement, sql] :
        {std::pair<Statement*, std::string_view>{&statements_.begin, "BEGIN IMMEDIATE"},
         {&statements_.commit, "COMMIT"},
-        {&statements_.rollback, "ROLLBACK"},
         {&statements_.pages, "PRAGMA page_count"},
         {&statements_.freePages, "PRAGMA freelist_count"},
         {&statements_.vacuum, vacuum},
@@ -103,10 +102,7 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   if (code == SQLITE_OK) code = deleteForSize(kinds, more);
   if (code == SQLITE_OK) code = shrinkFile(more);
   if (code == SQLITE_OK) code = statements_.commit.run();
-  if (code != SQLITE_OK) {
-    static_cast<void>(statements_.rollback.run());
-    return code;
-  }
+  if (code != SQLITE_OK) return code;
   // The file becomes shorter only when the log is copied into it.
   const bool hasShrunk = fileBytes() < before;
   // Copy the log only once, at the end of a series of steps.

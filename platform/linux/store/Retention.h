@@ -29,7 +29,8 @@ class Retention {
   void release();
 
   // Runs one step in a transaction of its own. `now` is seconds since 1970. Sets `more` to whether
-  // another call would find work. Rolls the step back after an error.
+  // another call would find work. After an error the transaction may still be open: the caller
+  // reads the text of the error and then rolls back, because a rollback replaces the text.
   [[nodiscard]] SqliteCode runOnce(double now, std::span<RecordKind* const> kinds, bool& more);
 
  private:
@@ -47,7 +48,6 @@ class Retention {
   struct Statements {
     Statement begin;
     Statement commit;
-    Statement rollback;
     Statement pages;
     Statement freePages;
     Statement vacuum;

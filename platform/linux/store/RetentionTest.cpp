@@ -7,7 +7,9 @@
 namespace halvox::platform::linux_ {
 namespace {
 
+using ::testing::Contains;
 using ::testing::ElementsAre;
+using ::testing::HasSubstr;
 using ::testing::SizeIs;
 
 constexpr double kDay = 86'400;
@@ -115,6 +117,26 @@ TEST_F(RetentionTest, ShrinksTheFileWhenTheLimitWasLowered) {
   stop();
   EXPECT_LE(bytesOnDisk(), 1024U * 1024U);
   EXPECT_TRUE(payloads().back().starts_with("{\"n\":25999,"));
+}
+
+// A trigger makes the step fail. RAISE(ROLLBACK) ends the transaction, RAISE(ABORT) leaves it open.
+TEST_F(RetentionTest, LogsWhyAStepFailedAndUndoesTheStep) {
+  for (const std::string how : {"ABORT", "ROLLBACK"}) {
+    SCOPED_TRACE(how);
+    options.directory = scratch.path() / how;
+    start();
+    sendAt(kNow - 40 * kDay, 1);
+    stop();
+    std::string trigger = "CREATE TRIGGER keep BEFORE DELETE ON message_blocks BEGIN SELECT RAISE(";
+    trigger.append(how).append(", 'kept by a test (").append(how).append(")'); END");
+    execute(database(), trigger);
+    start();
+    stop();
+
+    EXPECT_THAT(platform.log.texts(LogLevel::kError),
+                Contains(HasSubstr("cannot delete old records: kept by a test (" + how)));
+    EXPECT_THAT(payloads(), ElementsAre(numbered(1)));
+  }
 }
 
 }  // namespace

@@ -348,6 +348,7 @@ bool SqliteStore::maintainOnce() {
   if (!database_.isOpen()) return false;
   bool more = false;
   const double now = clock_.currentDate().secondsSince1970;
+  errno = 0;  // read by fail()
   const SqliteCode code = retention_.runOnce(now, kinds_, more);
   if (code == SQLITE_OK) return more;
   fail(code, "cannot delete old records");
