@@ -55,6 +55,21 @@ bool anyExists(const std::filesystem::path& base) {
   return false;
 }
 
+// Creates an empty file; fails with EEXIST if there is one. A file that root creates gets the owner
+// of the directory: halvoxctl, run by root, may be the first to need the file, and the service, run
+// by a user of its own, must be able to open it later.
+UniqueFd createOwned(const std::filesystem::path& directory, const std::filesystem::path& file) {
+  UniqueFd made(::open(file.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
+  struct stat owner {};
+  if (!made || ::geteuid() != 0 || ::stat(directory.c_str(), &owner) != 0 || owner.st_uid == 0) {
+    return made;
+  }
+  // If this fails, the file is usable for this process, and the service reports what it cannot
+  // open.
+  static_cast<void>(::fchown(made.get(), owner.st_uid, owner.st_gid));
+  return made;
+}
+
 }  // namespace
 
 std::optional<FileIdentity> fileIdentity(const std::filesystem::path& path) {
@@ -78,7 +93,8 @@ Result<void, StoreError> StoreFiles::claimDirectory() {
                    error.value());
   }
   const std::filesystem::path path = directory_ / kLockFileName;
-  lock_.reset(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kFileMode));
+  lock_ = createOwned(directory_, path);
+  if (!lock_ && errno == EEXIST) lock_.reset(::open(path.c_str(), O_RDWR | O_CLOEXEC));
   if (!lock_) {
     return failure(StoreError::kDirectory, path, "cannot open the lock file", errno);
   }
@@ -101,7 +117,7 @@ Result<void, StoreError> StoreFiles::makeDatabaseFile() {
   }
   // Create the file here, because SQLite would make it readable for all users. SQLite gives the log
   // the same mode as the database.
-  const UniqueFd made(::open(database_.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
+  const UniqueFd made = createOwned(directory_, database_);
   if (made || errno == EEXIST) return {};
   return failure(StoreError::kDirectory, database_, "cannot create the database file", errno);
 }

@@ -5,6 +5,9 @@
 #include <optional>
 #include <string>
 
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::linux_ {
@@ -139,6 +142,32 @@ TEST_F(StoreVacuumTest, VacuumsAStoreWithoutAService) {
 
   ASSERT_TRUE(state) << state.error().message;
   EXPECT_THAT(payloads(), ElementsAre(numbered(2)));
+}
+
+// The service runs as a user of its own, and must be able to open what root has made.
+TEST_F(StoreVacuumTest, FilesThatRootMakesBelongToTheOwnerOfTheDirectory) {
+  if (::geteuid() != 0) GTEST_SKIP() << "needs the right to give files away";
+  constexpr uid_t kUser = 65'534;
+  constexpr gid_t kGroup = 65'533;
+  start();
+  sendAt(kNow, 1);
+  stop();
+  const auto lock = options.directory / "halvox.lock";
+  for (const auto& path : {options.directory, database()}) {
+    ASSERT_EQ(::chown(path.c_str(), kUser, kGroup), 0) << path;
+  }
+  ASSERT_TRUE(std::filesystem::remove(lock));
+
+  const auto state = vacuumClosed({.before = kNow - kHour});
+
+  ASSERT_TRUE(state) << state.error().message;
+  for (const auto& entry : std::filesystem::directory_iterator(options.directory)) {
+    struct stat status {};
+    ASSERT_EQ(::stat(entry.path().c_str(), &status), 0);
+    EXPECT_EQ(status.st_uid, kUser) << entry.path();
+    EXPECT_EQ(status.st_gid, kGroup) << entry.path();
+  }
+  EXPECT_TRUE(std::filesystem::exists(lock));
 }
 
 TEST_F(StoreVacuumTest, LeavesTheStoreOfAServiceAlone) {
