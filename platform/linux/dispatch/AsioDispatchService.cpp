@@ -50,6 +50,8 @@ void AsioDispatchService::wakePool() { DispatchThread::current().wakePool(); }
 
 std::uint64_t AsioDispatchService::finish(const FinishLimits& limits) {
   wakePool();  // starts the turns that this thread still holds back
+  // The timer may have expired, but its thread may not have started the jobs yet.
+  pool_->delayedJobs().startDue();
   const auto end = std::chrono::steady_clock::now() + limits.total;
   QueueLabels::Jobs before = jobs();
   while (true) {
@@ -65,6 +67,9 @@ std::uint64_t AsioDispatchService::finish(const FinishLimits& limits) {
 
 QueueLabels::Jobs AsioDispatchService::jobs() {
   QueueLabels::Jobs sum = pool_->labels().jobs();
+  const QueueLabels::Jobs delayed = pool_->delayedJobs().dueJobs();
+  sum.run += delayed.run;
+  sum.added += delayed.added;
   const MutexLock lock(mutex_);
   for (const auto& queue : ownThreadQueues_) {
     const QueueLabels::Jobs jobs = queue->jobs();

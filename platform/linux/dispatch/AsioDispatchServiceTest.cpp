@@ -6,7 +6,6 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <future>
 #include <memory>
 #include <optional>
@@ -231,85 +230,6 @@ TEST_F(AsioDispatchServiceTest, QueuesMayOutliveTheService) {
   own->async(JobWeight::kBrief, [] { FAIL(); });
   shared->async(JobWeight::kBrief, [] { FAIL(); });
   EXPECT_EQ(count("jobs discarded at the stop"), 2U);
-}
-
-class AsioDispatchFinishTest : public AsioDispatchServiceTest,
-                               public testing::WithParamInterface<QueueThreading> {};
-
-INSTANTIATE_TEST_SUITE_P(Queues, AsioDispatchFinishTest,
-                         testing::Values(QueueThreading::kOwnThread, QueueThreading::kShared),
-                         [](const auto& one) {
-                           return one.param == QueueThreading::kShared ? "Shared" : "OwnThread";
-                         });
-
-TEST_P(AsioDispatchFinishTest, FinishWaitsAsLongAsJobsEnd) {
-  constexpr int kJobs = 16;
-  const auto queue = createQueue(GetParam());
-  std::promise<void> never;
-  const std::shared_future<void> longJob = never.get_future().share();
-  std::atomic<int> ran{0};
-  for (int job = 0; job < kJobs; ++job) {
-    queue->async(JobWeight::kMayBlock, [&ran, longJob] {
-      longJob.wait_for(std::chrono::milliseconds(100));
-      ++ran;
-    });
-  }
-
-  // All jobs together take longer than the limit for one of them. The limit is many times as long
-  // as a job, because a busy machine delays single jobs.
-  EXPECT_EQ(service_->finish(
-                {.withoutProgress = std::chrono::milliseconds(1500), .total = kTestDeadline}),
-            0U);
-
-  EXPECT_EQ(ran, kJobs);
-  EXPECT_TRUE(service_->stop(kTestDeadline));
-}
-
-// A summary file is written on a shared queue. The rest of the stop is a job of the reporting
-// queue, which has a thread of its own, and adds the last job to the queue of a link.
-TEST_F(AsioDispatchServiceTest, FinishWaitsForJobsThatJobsAddToOtherQueues) {
-  const auto shared = createQueue(QueueThreading::kShared);
-  const auto own = createQueue(QueueThreading::kOwnThread);
-  std::promise<void> never;
-  std::atomic<bool> hasEnded{false};
-  shared->async(JobWeight::kMayBlock, [&] {
-    own->async(JobWeight::kMayBlock, [&] {
-      // The shared queue is empty here. finish() must still wait.
-      never.get_future().wait_for(std::chrono::milliseconds(100));
-      shared->async(JobWeight::kMayBlock, [&] { hasEnded = true; });
-    });
-  });
-
-  EXPECT_EQ(service_->finish({.withoutProgress = kTestDeadline, .total = kTestDeadline}), 0U);
-
-  EXPECT_TRUE(hasEnded);
-  EXPECT_TRUE(service_->stop(kTestDeadline));
-}
-
-TEST_P(AsioDispatchFinishTest, FinishEndsWithoutProgressAndSaysWhatIsLeft) {
-  StuckQueue stuck(*service_, "stuck", GetParam());
-  const auto queue =
-      service_->createSerialQueue("q", QualityOfService::kUtility, QueueThreading::kShared);
-  queue->async(JobWeight::kBrief, [] {});
-  ASSERT_TRUE(drain(*queue));
-
-  EXPECT_EQ(
-      service_->finish({.withoutProgress = std::chrono::milliseconds(20), .total = kTestDeadline}),
-      1U);
-
-  stuck.release();
-}
-
-TEST_P(AsioDispatchFinishTest, FinishIsBoundedEvenIfJobsEndForEver) {
-  const auto queue = createQueue(GetParam());
-  std::function<void()> again = [&] { queue->async(JobWeight::kBrief, again); };
-  again();
-
-  EXPECT_GE(service_->finish({.withoutProgress = std::chrono::milliseconds(20),
-                              .total = std::chrono::milliseconds(60)}),
-            1U);
-
-  EXPECT_TRUE(service_->stop(kTestDeadline));
 }
 
 class AsioDispatchWaitTest : public AsioDispatchServiceTest {

@@ -104,29 +104,55 @@ void DelayedJobs::onTimer() {
   std::uint64_t expirations = 0;
   // If the timer was set again after it had expired, there is nothing to read. The timer will
   // expire again.
-  if (::read(timer_.native_handle(), &expirations, sizeof(expirations)) > 0) {
-    const Time now = std::chrono::steady_clock::now();
-    while (!jobs_.empty() && jobs_.begin()->first.first <= now) {
-      auto node = jobs_.extract(jobs_.begin());
-      // The job runs on a thread of its own quality. This thread only watches the timer.
-      asio::post(pool_.context(node.mapped().quality),
-                 [this, job = std::move(node.mapped().job)] { runDue(job); });
-    }
-    arm();
-  }
+  if (::read(timer_.native_handle(), &expirations, sizeof(expirations)) > 0) postDue();
   awaitTimer();
 }
 
-void DelayedJobs::runDue(const Job& job) {
+void DelayedJobs::startDue() {
+  const MutexLock lock(mutex_);
+  if (!isStopped_) postDue();
+}
+
+void DelayedJobs::postDue() {
+  const Time now = std::chrono::steady_clock::now();
+  while (!jobs_.empty() && jobs_.begin()->first.first <= now) {
+    auto node = jobs_.extract(jobs_.begin());
+    // Begin the turn under the lock. The job is therefore always either delayed or counted.
+    pool_.turns().begin();
+    ++due_.added;
+    // The job runs on a thread of its own quality, because this thread may be the one that watches
+    // the timer.
+    asio::post(pool_.context(node.mapped().quality),
+               [this, job = std::move(node.mapped().job)]() mutable { runDue(std::move(job)); });
+  }
+  arm();
+}
+
+void DelayedJobs::runDue(Job job) {
   bool isStopped = false;
   {
     const MutexLock lock(mutex_);
     isStopped = isStopped_;
   }
   // Discard the job if it was posted before the stop but would run after it.
-  if (isStopped) return pool_.runner().countDiscarded(1);
-  const DispatchThread::Working working(nullptr, "delayed");
-  pool_.runner().run(job);
+  if (isStopped) {
+    pool_.runner().countDiscarded(1);
+  } else {
+    const DispatchThread::Working working(nullptr, "delayed");
+    pool_.runner().run(job);
+  }
+  // Destroy the job before its turn ends, because an object that it holds may add jobs.
+  job = nullptr;
+  {
+    const MutexLock lock(mutex_);
+    ++due_.run;
+  }
+  pool_.turns().end();
+}
+
+QueueLabels::Jobs DelayedJobs::dueJobs() {
+  const MutexLock lock(mutex_);
+  return due_;
 }
 
 }  // namespace halvox::platform::linux_

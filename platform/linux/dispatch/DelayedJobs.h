@@ -11,6 +11,7 @@
 #include "platform/dispatch.h"
 #include "platform/linux/base/Mutex.h"
 #include "platform/linux/dispatch/JobRunner.h"
+#include "platform/linux/dispatch/QueueLabels.h"
 
 namespace halvox::platform::linux_ {
 
@@ -24,7 +25,8 @@ class DispatchPool;
 // would delay it.
 //
 // Owned by the pool. Any thread may add jobs. Due jobs run on the pool's threads of their quality,
-// in no particular order relative to other jobs. The number of jobs has no bound here, because
+// in no particular order relative to other jobs. Each has a turn (OpenTurns) from the moment when
+// it is due until it has ended. The number of jobs has no bound here, because
 // waiting messages are charged to the clients that sent them. No thread of the pool may run when
 // this object is destroyed.
 class DelayedJobs {
@@ -42,6 +44,10 @@ class DelayedJobs {
   Ticket add(std::chrono::nanoseconds delay, QualityOfService quality, Job job);
   // Destroys a job that is not due yet. Does nothing to a job that is about to run or has run.
   void cancel(const Ticket& ticket);
+  // Starts the jobs that are due now, without waiting for the timer.
+  void startDue();
+  // The jobs that have become due, and those of them that have ended.
+  [[nodiscard]] QueueLabels::Jobs dueJobs();
   // Discards and counts all jobs, including those that are added later.
   void stop();
 
@@ -55,13 +61,15 @@ class DelayedJobs {
   void arm() HALVOX_REQUIRES(mutex_);
   void awaitTimer() HALVOX_REQUIRES(mutex_);
   void onTimer();
-  void runDue(const Job& job);
+  void postDue() HALVOX_REQUIRES(mutex_);
+  void runDue(Job job);
 
   DispatchPool& pool_;
   Mutex mutex_;
   bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;
   std::map<Ticket, Delayed> jobs_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t added_ HALVOX_GUARDED_BY(mutex_) = 0;
+  QueueLabels::Jobs due_ HALVOX_GUARDED_BY(mutex_);
   std::optional<Time> armedFor_ HALVOX_GUARDED_BY(mutex_);
   asio::posix::stream_descriptor timer_ HALVOX_GUARDED_BY(mutex_);
 };
