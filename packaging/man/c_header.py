@@ -8,6 +8,9 @@ BANNER = re.compile(r"/\* -+ (.*?) -+ \*/")
 PART = re.compile(r"/\*\*(?!<)(.*?)\*/(.*?)(?=/\*\*(?!<)|/\* -|\Z)|/\* -+ (.*?) -+ \*/", re.DOTALL)
 CODE = re.compile(r"@code\S*\n(.*?)@endcode\n?", re.DOTALL)
 
+# What stands before a function of the interface.
+PREFIX = re.compile(r"HALVOX_API |static inline ")
+
 
 def comment_text(comment):
     """The words of a comment, without the stars at the beginnings of its lines."""
@@ -35,14 +38,16 @@ def prose(text):
 def declarations(code):
     """The C code between two comments, without what only compilers need."""
     code = re.sub(r"#ifdef __cplusplus\n.*?#endif\n", "", code, flags=re.DOTALL)
+    # The bodies of inline functions are not for readers.
+    code = re.sub(r"^(static inline .*?\)) \{\n.*?^\}$", r"\1;", code, flags=re.DOTALL | re.MULTILINE)
     kept, shift = [], 0
     for line in code.split("\n"):
         # A macro belongs to the interface if it is a number.
         if line.startswith("#") and not re.match(r"#define \w+ [\w(]*\d", line):
             continue
         # The further lines of a function are indented to its bracket, which moves with its first line.
-        if line.startswith("HALVOX_API "):
-            line, shift = line.removeprefix("HALVOX_API "), len("HALVOX_API ")
+        if prefix := PREFIX.match(line):
+            line, shift = line[prefix.end():], prefix.end()
         elif shift:
             line = line[min(shift, len(line) - len(line.lstrip())):]
         shift = 0 if line.endswith(";") else shift

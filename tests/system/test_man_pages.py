@@ -11,7 +11,7 @@ from harness import DEADLINE
 from installation import Installation, run
 
 # Pages that belong to no program.
-OTHERS = {"halvox.toml.5", "halvox-database.5", "halvox-protocol.7", "libhalvox-client.3"}
+OTHERS = {"halvox.toml.5", "halvox-database.5", "halvox-protocol.7", "libhalvox-client.3", "libhalvox-trace.3"}
 OPTION = re.compile(r"^\s*(-[^\s,]*(?:,\s*-\S+)*)", re.MULTILINE)
 REFERENCE = re.compile(r"\b((?:lib)?halvox[\w.-]*)\((\d)\)")
 
@@ -95,13 +95,25 @@ class ManPagesTest(Installation):
         self.assertGreater(len(keys), 30)
         self.assertEqual([key for key in keys if key not in terms], [])
 
-    def test_the_page_of_the_library_has_each_function(self):
-        header = (ROOT / "client/halvox.h").read_text(encoding="utf-8")
-        functions = re.findall(r"^HALVOX_API .*?\b(halvox_\w+)\(", header, re.MULTILINE)
-        text = self.shown("libhalvox-client.3")
+    def test_the_page_of_each_library_has_each_function(self):
+        for page, file, least in (("libhalvox-client.3", "halvox.h", 40), ("libhalvox-trace.3", "halvox_trace.h", 1)):
+            header = (ROOT / "client" / file).read_text(encoding="utf-8")
+            functions = re.findall(r"^(?:HALVOX_API|static inline|void) .*?\b(halvox_\w+)\(", header, re.MULTILINE)
+            text = self.shown(page)
 
-        self.assertGreater(len(functions), 40)
-        self.assertEqual([name for name in functions if f"{name}(" not in text], [])
+            self.assertGreater(len(functions), least)
+            self.assertEqual([name for name in functions if not re.search(rf"[ *]{name}\((?!\))", text)], [], page)
+
+    def test_the_page_of_an_inline_function_shows_how_to_call_it_and_not_its_body(self):
+        text = self.shown("libhalvox-trace.3")
+
+        self.assertRegex(text, r"\bvoid halvox_trace\(uint32_t code, [^{]*?uint64_t argument4\);")
+        self.assertNotIn("__atomic_load_n", text)
+
+    def test_each_installed_c_header_has_a_page(self):
+        for header in (self.prefix / "include").glob("*.h"):
+            pages = [name for name in self.pages if f"#include <{header.name}>" in self.shown(name)]
+            self.assertNotEqual(pages, [], header.name)
 
     def test_the_page_of_the_protocol_has_each_request(self):
         interface = (ROOT / "packaging/dbus/com.tarno.halvox.HVReportingServiceProtocol.xml").read_text()
