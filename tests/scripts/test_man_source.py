@@ -58,6 +58,15 @@ HALVOX_API int take_two(int one,
                         int two);
 /** @} */
 
+/** Takes it at once. */
+static inline int take_now(int one,
+                           int two) {
+  if (one > two) {
+    return one;
+  }
+  return two;
+}
+
 /** A pair. */
 typedef struct pair {
   int one; /**< the first */
@@ -145,6 +154,9 @@ class HeaderTest(unittest.TestCase):
     def test_functions_that_share_a_comment_stand_together(self):
         self.assertIn("```c\nint take(int number);\nint take_two(int one,\n             int two);\n```\n\n"
                       "Take a\nnumber.", self.text)
+
+    def test_an_inline_function_is_shown_without_its_body(self):
+        self.assertIn("```c\nint take_now(int one,\n             int two);\n```\n\nTakes it at once.", self.text)
 
     def test_a_banner_is_a_heading(self):
         self.assertIn("\n## Calls\n", self.text)
