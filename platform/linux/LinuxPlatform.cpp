@@ -107,11 +107,13 @@ Result<void, int> LinuxPlatform::open() {
 }
 
 bool LinuxPlatform::close() {
-  // First stop what adds jobs to the queues. Captures add jobs for their replies.
+  // First stop what adds jobs to the queues. Captures add jobs for their replies. Requests that are
+  // carried out below may still ask for a capture: it is refused, counted and answered.
   adapters_->diagnosticReporters.stop();
   adapters_->notify.stop();  // adds the jobs of handlers
   // Stop traces before the queues, because a stop of a session may wait for a trace that is still
-  // being read.
+  // being read. The end of the service would otherwise take as long as reading its traces, whose
+  // results may therefore be incomplete.
   adapters_->traces->stop();
   // A message that was answered without an error must reach the link. The queue of its session may
   // still hold it, because these queues have a lower priority than requests. A stop that has begun
