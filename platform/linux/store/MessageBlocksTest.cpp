@@ -343,6 +343,7 @@ void makeVersion2(const std::filesystem::path& database) {
           "CREATE VIEW analytics_events AS SELECT 1; CREATE VIEW link_messages AS SELECT 1;"
           "DROP TABLE message_blocks; DROP TABLE message_spans; DROP VIEW losses;"
           "DROP TABLE loss_records; DROP TABLE loss_spans; DROP VIEW runs; DROP TABLE run_records;"
+          "DROP TABLE link_spool;"
           "PRAGMA user_version = 2");
 }
 

@@ -65,6 +65,7 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
       issueMetrics_(queue_, environment.statistics, sizes_.payloadBytes),
       powerEvents_(queue_, environment.statistics, sizes_.payloadBytes),
       snapshots_(queue_, environment.statistics, sizes_.payloadBytes),
+      spooledMessages_(queue_, environment.statistics, environment.clock, sizes_.payloadBytes),
       losses_(environment.statistics, environment.clock),
       retention_({.age = std::chrono::days(options.retentionDays),
                   .databaseBytes = sizes_.databaseBytes,

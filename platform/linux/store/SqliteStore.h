@@ -27,6 +27,7 @@
 #include "platform/linux/store/StoreRecords.h"
 #include "platform/linux/store/StoreVacuum.h"
 #include "platform/linux/store/WriterQueue.h"
+#include "platform/linux/store/spool/SpooledMessages.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
@@ -90,7 +91,10 @@ class SqliteStore {
   [[nodiscard]] PowerEventRecords& powerEvents() { return powerEvents_; }
   [[nodiscard]] LinkMessageRecords& linkMessages() { return linkMessages_; }
   [[nodiscard]] SnapshotRecords& snapshots() { return snapshots_; }
+  [[nodiscard]] SpooledMessages& spooledMessages() { return spooledMessages_; }
   [[nodiscard]] const ClockService& clock() const { return clock_; }
+  // The path of the database. Never changes.
+  [[nodiscard]] const std::filesystem::path& databaseFile() const { return files_.database(); }
   // Returns the number of records that wait to be stored. Any thread may call.
   [[nodiscard]] std::uint64_t waiting() { return queue_.waiting(); }
   // Returns true while many records wait. A caller that adds a record may then have to wait. Any
@@ -141,11 +145,13 @@ class SqliteStore {
   IssueMetricRecords issueMetrics_;
   PowerEventRecords powerEvents_;
   SnapshotRecords snapshots_;
+  SpooledMessages spooledMessages_;
   LossRecords losses_;
   OldRecords oldEvents_{"analytics_records", "analytics_spans"};
   OldRecords oldLinkMessages_{kLinkMessages.records, kLinkMessages.spans};
-  const std::array<RecordKind*, 7> kinds_{&messages_, &issueMetrics_, &powerEvents_,    &snapshots_,
-                                          &losses_,   &oldEvents_,    &oldLinkMessages_};
+  const std::array<RecordKind*, 8> kinds_{&messages_,        &issueMetrics_,   &powerEvents_,
+                                          &snapshots_,       &losses_,         &oldEvents_,
+                                          &oldLinkMessages_, &spooledMessages_};
 
   // After open() only the writer's thread uses these.
   Database database_;

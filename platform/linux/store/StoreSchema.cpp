@@ -181,9 +181,21 @@ CREATE VIEW runs(run, start, last_commit, ending) AS
 SELECT id, start_time, last_commit, ending FROM run_records;
 )sql";
 
+// Messages of the link that no server has acknowledged (spool/SpooledMessages.h). `first` is the
+// number of the row's first message, `sent` how many of its first messages were acknowledged.
+constexpr std::string_view kLinkSpool = R"sql(
+CREATE TABLE link_spool(
+  first INTEGER PRIMARY KEY,
+  messages INTEGER NOT NULL,
+  sent INTEGER NOT NULL,
+  time REAL NOT NULL,
+  block BLOB NOT NULL);
+)sql";
+
 // Step n migrates from version n to version n + 1. Never change a step that was released, because
 // stores that have already applied it would differ from new ones.
-constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks, kLosses, kRuns};
+constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks,
+                                 kLosses,          kRuns,         kLinkSpool};
 
 }  // namespace
 

@@ -11,6 +11,7 @@
 #include "platform/linux/store/RecordTables.h"
 #include "platform/linux/store/StoreFiles.h"
 #include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/spool/SpoolTable.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -73,8 +74,9 @@ struct StoredKinds {
   OldRecords losses{kLosses.records, kLosses.spans};
   OldRecords events{"analytics_records", "analytics_spans"};
   OldRecords linkMessages{kLinkMessages.records, kLinkMessages.spans};
-  const std::array<RecordKind*, 7> all{&messages, &issueMetrics, &powerEvents, &snapshots,
-                                       &losses,   &events,       &linkMessages};
+  StoredSpool spool;
+  const std::array<RecordKind*, 8> all{&messages, &issueMetrics, &powerEvents,  &snapshots,
+                                       &losses,   &events,       &linkMessages, &spool};
 
   [[nodiscard]] SqliteCode prepare(Database& database) {
     SqliteCode code = SQLITE_OK;

@@ -10,12 +10,15 @@
 #include "platform/linux/store/reading/verify/LogVerifier.h"
 #include "platform/linux/store/reading/verify/RowVerifier.h"
 #include "platform/linux/store/reading/verify/SchemaVerifier.h"
+#include "platform/linux/store/reading/verify/SpoolVerifier.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
 // The first schema version with run_records.
 constexpr std::int64_t kRunsSinceVersion = 5;
+// The first schema version with link_spool.
+constexpr std::int64_t kSpoolSinceVersion = 6;
 
 struct RowsOfVersion {
   VerifiedRows rows;
@@ -80,6 +83,9 @@ SqliteCode StoreVerifier::verifySnapshot(VerifiedStore& store) {
   if (code != SQLITE_OK || !hasTables) return code;
   code = verifyRecords(store);
   if (code == SQLITE_OK && store.version >= kRunsSinceVersion) code = verifyRuns();
+  if (code == SQLITE_OK && store.version >= kSpoolSinceVersion) {
+    code = verifySpool(database, differences_, store.records);
+  }
   if (code == SQLITE_OK && store.version >= kRows[1].sinceVersion) code = readCaptures(store);
   return code;
 }

@@ -279,6 +279,37 @@ TEST_F(StoreVerifierTest, FindsARunThatDoesNotSayHowItEnded) {
   EXPECT_THAT(verify(), ElementsAre("run_records, row 1: does not say how the run ended"));
 }
 
+TEST_F(StoreVerifierTest, FindsDamagedRowsOfTheSpool) {
+  start();
+  for (const char* const identifier : {"1", "2", "3", "4"}) {
+    ASSERT_NE(store->spooledMessages().append({"s", identifier, ""}), 0U);
+    ASSERT_TRUE(eventually([&] { return !store->spooledMessages().hasUnstored(); }));
+  }
+  stop();
+  ASSERT_THAT(verify(), IsEmpty());
+  execute(database(),
+          "UPDATE link_spool SET block = x'00' WHERE first = 1;"
+          "UPDATE link_spool SET sent = 1 WHERE first = 2;"
+          "UPDATE link_spool SET messages = 2 WHERE first = 4;");
+
+  EXPECT_THAT(verify(), ElementsAre("link_spool, row 1: cannot be read as 1 messages",
+                                    "link_spool, row 2: says that 1 of its 1 messages were sent",
+                                    "link_spool, row 4: cannot be read as 2 messages"));
+}
+
+TEST_F(StoreVerifierTest, FindsNumbersOfTheSpoolThatAreUsedTwice) {
+  start();
+  for (std::int64_t number = 0; number < 500; ++number) {
+    ASSERT_NE(store->spooledMessages().append({"s", "i", ""}), 0U);
+  }
+  stop();
+  execute(database(),
+          "INSERT INTO link_spool SELECT first + messages - 1, messages, 0, time, block"
+          " FROM link_spool WHERE messages > 1 ORDER BY first DESC LIMIT 1");
+
+  EXPECT_THAT(verify(), ElementsAre(HasSubstr("has numbers of the row before")));
+}
+
 TEST_F(StoreVerifierTest, ShowsTheFirstDifferencesOfATable) {
   makeStore();
   execute(database(),
