@@ -163,7 +163,10 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
       resultsFiles(configuration.storage.root, *log, statistics),
       traces(makeTraceServices(traceOptions(configuration, featureFlags), *log, statistics)),
       dispatch(*log, statistics),
-      nats(makeNats(configuration.link, {dispatch, statistics})) {}
+      nats(makeNats(configuration.link,
+                    {.dispatch = dispatch,
+                     .statistics = statistics,
+                     .spool = configuration.link.spool ? &linkSpool : nullptr})) {}
 
 TLMReportingService& LinuxAdapters::realTimeLink() {
   if (nats && *nats) return **nats;

@@ -32,6 +32,7 @@
 #include "platform/linux/store/SqliteMetricService.h"
 #include "platform/linux/store/SqlitePowerLogService.h"
 #include "platform/linux/store/SqliteStore.h"
+#include "platform/linux/store/spool/SqliteLinkSpool.h"
 #include "platform/linux/tracing/JsonResultsFileService.h"
 #include "platform/linux/tracing/PlistPropertyListService.h"
 #include "platform/linux/tracing/TraceServices.h"
@@ -72,6 +73,7 @@ struct LinuxAdapters {
   SqliteStore store;
   SqliteAnalyticsService analytics;
   SqliteSnapshotRecorder snapshotRecorder{store};
+  SqliteLinkSpool linkSpool{store};
   SnapshotDiagnosticReporterService diagnosticReporters;
   RootedFileService files;
   FileOverflowService overflow;

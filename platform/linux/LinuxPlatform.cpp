@@ -94,6 +94,7 @@ Result<void, int> LinuxPlatform::open() {
   }
   // Open the store before the sockets, so that everything that is accepted can be stored.
   if (const auto opened = adapters_->store.open(); !opened) return startFailure(opened.error());
+  if (const auto& nats = adapters_->nats; *nats) (*nats)->resume();
   // Remove leftovers only after opening the store. Its lock shows that no other service uses the
   // directory, and therefore none uses these files.
   adapters_->diagnosticReporters.removeLeftovers();
@@ -130,7 +131,7 @@ bool LinuxPlatform::close() {
   const auto& nats = adapters_->nats;
   const bool linkEnded = !nats || !*nats || (*nats)->close();
   // Close the store after the link, because the local link writes messages to it until the link has
-  // ended.
+  // ended, and the link to NATS leaves there what it could not send.
   adapters_->store.close();
   // Log the counters after everything that counts has ended, because their sums agree only then.
   logStatistics(LogLevel::kInfo, Counters::kCounted);

@@ -19,7 +19,9 @@ TIMED_OUT = "timed out waiting for backends"
 
 
 def link(backend, *servers):
-    return f'[link]\nbackend = "{backend}"\n' + (f"servers = {json.dumps(servers)}\n" if servers else "")
+    """Without the spool, which takes the messages of a session whether a server is there or not."""
+    return (f'[link]\nbackend = "{backend}"\nspool = false\n'
+            + (f"servers = {json.dumps(servers)}\n" if servers else ""))
 
 
 def counters(service, piece):

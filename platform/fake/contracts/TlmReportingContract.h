@@ -130,6 +130,7 @@ TYPED_TEST_P(TlmReportingContract, LaterDiscoveriesAreNotAnsweredFromInsideTheCa
 TYPED_TEST_P(TlmReportingContract, EachOfManyDiscoveriesIsAnsweredExactlyOnce) {
   constexpr int kDiscoveries = 100;
   std::vector<std::shared_ptr<typename TestFixture::Discovery>> discoveries;
+  discoveries.reserve(kDiscoveries);
   for (int number = 0; number < kDiscoveries; ++number) {
     discoveries.push_back(this->discover(this->createSession(number)));
   }

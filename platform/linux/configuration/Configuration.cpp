@@ -190,6 +190,7 @@ void readLink(TableReader table, Configuration::Link& link) {
   table.readText("stream", isStreamName, "a name without blanks, dots, *, >, / and \\",
                  link.stream);
   table.read("replicas", kReplicas, link.replicas);
+  table.read("spool", link.spool);
   readLinkTls(table.table("tls"), link.tls);
   table.read("credentials", link.credentials, kLongestPath);
   table.finish();

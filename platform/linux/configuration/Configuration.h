@@ -58,8 +58,9 @@ struct Configuration {
     std::string subject = "halvox";                             // first part of all subjects
     std::string stream = "HALVOX";
     std::uint64_t replicas = defaults::kStreamReplicas;  // of a stream that the service creates
-    std::optional<Tls> tls;                              // none: TLS if a server's URL asks for it
-    std::filesystem::path credentials;                   // a NATS credentials file; empty: none
+    bool spool = true;       // whether the store keeps messages while no server takes them
+    std::optional<Tls> tls;  // none: TLS if a server's URL asks for it
+    std::filesystem::path credentials;  // a NATS credentials file; empty: none
   };
   struct Drivers {
     bool alsa = true;

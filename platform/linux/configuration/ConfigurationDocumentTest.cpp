@@ -101,6 +101,7 @@ TEST(ConfigurationDocumentTest, TheDefaultsOfThePageAreTheDefaults) {
   EXPECT_EQ(page.link.subject, none.link.subject);
   EXPECT_EQ(page.link.stream, none.link.stream);
   EXPECT_EQ(page.link.replicas, none.link.replicas);
+  EXPECT_EQ(page.link.spool, none.link.spool);
   EXPECT_EQ(page.drivers.alsa, none.drivers.alsa);
   EXPECT_EQ(page.drivers.alsaRoot, none.drivers.alsaRoot);
   EXPECT_EQ(page.drivers.pipewire, none.drivers.pipewire);

@@ -209,6 +209,7 @@ TEST_F(ConfigurationTest, LinkIsLocalByDefault) {
   EXPECT_EQ(link.servers, std::vector<std::string>{"nats://127.0.0.1:4222"});
   EXPECT_EQ(link.subject, "halvox");
   EXPECT_EQ(link.stream, "HALVOX");
+  EXPECT_TRUE(link.spool);
   EXPECT_FALSE(link.tls.has_value());
   EXPECT_TRUE(link.credentials.empty());
 }
@@ -220,6 +221,7 @@ backend = "nats"
 servers = ["nats://a:1", "tls://user:word@b:2"]
 subject = "fleet.audio"
 stream = "AUDIO"
+spool = false
 credentials = "~/halvox.creds"
 [link.tls]
 ca = "/etc/ca.pem"
@@ -233,6 +235,7 @@ verify = false
   EXPECT_EQ(link.servers, (std::vector<std::string>{"nats://a:1", "tls://user:word@b:2"}));
   EXPECT_EQ(link.subject, "fleet.audio");
   EXPECT_EQ(link.stream, "AUDIO");
+  EXPECT_FALSE(link.spool);
   EXPECT_EQ(link.credentials, directory_ / "halvox.creds");
   ASSERT_TRUE(link.tls.has_value());
   EXPECT_EQ(link.tls->ca, "/etc/ca.pem");

@@ -20,6 +20,9 @@ void AckLedger::note(Account& account, AckOutcome outcome) {
     case AckOutcome::kFailed:
       ++account.tally.notAcknowledged;
       return;
+    case AckOutcome::kKept:
+      ++account.tally.kept;
+      return;
     case AckOutcome::kRefused:
       return;
   }

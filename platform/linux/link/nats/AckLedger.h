@@ -8,16 +8,18 @@
 
 namespace halvox::platform::linux_ {
 
-// How many of the messages for which one flush waited were acknowledged, and how many were not.
+// What became of the messages for which one flush waited.
 struct AckTally {
   std::uint64_t acknowledged = 0;
   std::uint64_t notAcknowledged = 0;
+  std::uint64_t kept = 0;  // in the store, for later
   friend bool operator==(const AckTally&, const AckTally&) = default;
 };
 
 enum class AckOutcome : std::uint8_t {
   kAcknowledged,
   kFailed,
+  kKept,     // a server gets it later, perhaps after a restart of the service
   kRefused,  // the sender got an error instead; no flush counts it
 };
 

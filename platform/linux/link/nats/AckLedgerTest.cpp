@@ -48,11 +48,12 @@ TEST(AckLedgerTest, FlushReportsOutcomesThatCameBeforeIt) {
   ledger.resolve(ledger.add(), AckOutcome::kAcknowledged);
   ledger.resolve(ledger.add(), AckOutcome::kFailed);
   ledger.resolve(ledger.add(), AckOutcome::kRefused);
+  ledger.resolve(ledger.add(), AckOutcome::kKept);
   Flushed flushed;
 
   ledger.flush(flushed.done());
 
-  EXPECT_EQ(flushed.tally, (AckTally{1, 1}));
+  EXPECT_EQ(flushed.tally, (AckTally{.acknowledged = 1, .notAcknowledged = 1, .kept = 1}));
 }
 
 TEST(AckLedgerTest, FlushDoesNotWaitForLaterMessages) {

@@ -2,7 +2,7 @@
 
 namespace halvox::platform::linux_ {
 
-NatsTlmReporting* halvox_link_nats_1(const Configuration::Link& options,
+NatsTlmReporting* halvox_link_nats_2(const Configuration::Link& options,
                                      const NatsEnvironment& environment) {
   return makeNatsTlmReporting(options, environment).release();
 }

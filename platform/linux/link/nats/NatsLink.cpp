@@ -1,6 +1,7 @@
 #include "platform/linux/link/nats/NatsLink.h"
 
 #include <algorithm>
+#include <span>
 #include <system_error>
 #include <utility>
 
@@ -20,7 +21,7 @@ constexpr std::int64_t kDefaultSpin = -1;  // how long the library spins on its 
 NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environment)
     : options_(std::move(options)),
       dispatch_(environment.dispatch),
-      publisher_(options_, environment.statistics, [this] {
+      publisher_(options_, environment.statistics, environment.spool, [this] {
         const MutexLock lock(mutex_);
         changed_.notifyAll();
       }) {
@@ -34,7 +35,50 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
 
 NatsLink::~NatsLink() { static_cast<void>(close()); }
 
+void NatsLink::resume() {
+  // The store's thread must not wait for this link's lock: a thread that holds it may wait for the
+  // store.
+  publisher_.resume([link = weak_from_this(), &dispatch = dispatch_] {
+    dispatch.asyncAfterOnBackgroundQueue(std::chrono::nanoseconds(0), [link] {
+      const auto self = link.lock();
+      if (!self) return;
+      const MutexLock lock(self->mutex_);
+      self->changed_.notifyAll();
+    });
+  });
+  const MutexLock lock(mutex_);
+  if (!publisher_.hasUnsent()) return;
+  if (const std::string failure = provideThread(); !failure.empty()) {
+    kLog.error("messages of an earlier run wait for the first session: ", failure);
+  }
+}
+
+// Answers at once if messages can be kept: the spool takes the messages of the session whatever
+// becomes of the servers. Returns false otherwise.
+bool NatsLink::discoverLater(TLMReportingService::BackendsCallback& found) {
+  Array servers;
+  {
+    const MutexLock lock(mutex_);
+    // Callers that find a connection get its servers, which may have named others.
+    if (closeBy_ || state_ == State::kConnected || !publisher_.canKeep()) return false;
+    std::vector<Value> values;
+    for (const std::string& server : options_.servers)
+      values.emplace_back(std::string_view(server));
+    servers = Array(std::span<const Value>(values));
+    isAttemptWanted_ = true;
+    nextAttempt_ = std::min(nextAttempt_, lastAttempt_ + kAttemptPause);
+    // Without its thread the link keeps messages all the same. Each message tries to start it.
+    static_cast<void>(provideThread());
+    wakeThread();
+  }
+  dispatch_.asyncAfterOnBackgroundQueue(
+      std::chrono::nanoseconds(0),
+      [found = std::exchange(found, nullptr), servers] { found(servers); });
+  return true;
+}
+
 void NatsLink::discover(TLMReportingService::BackendsCallback found) {
+  if (discoverLater(found)) return;
   std::uint64_t waiter = 0;
   std::string failure;
   {
@@ -84,6 +128,10 @@ std::optional<Error> NatsLink::refusal(std::size_t bytes) {
     return refusedByLink("the message has " + std::to_string(bytes) +
                          " bytes; the NATS server accepts at most " + std::to_string(maxPayload_));
   }
+  if (publisher_.canKeep()) {
+    static_cast<void>(provideThread());
+    return std::nullopt;
+  }
   // If an attempt to connect has just failed, refuse the message. The sender then gets the error at
   // once, not after another time-out.
   if (state_ == State::kIdle && !lastFailure_.empty() &&
@@ -110,17 +158,40 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
   {
     const MutexLock lock(mutex_);
     error = refusal(message.bytes);
-    // Call take() under this lock. After close() has begun, no message may enter the queue, because
-    // it would not be counted.
-    if (!error) error = publisher_.take(message);
-    if (!error) {
+  }
+  // Call take() without this lock, because it may wait for the store. At the end of the link, it
+  // refuses messages itself.
+  if (!error) error = publisher_.take(message);
+  if (!error) {
+    bool mustKeepLater = false;
+    {
+      const MutexLock lock(mutex_);
       wakeThread();
-      return std::nullopt;
+      mustKeepLater =
+          !hasConnection() && publisher_.canKeep() && !std::exchange(isKeptLater_, true);
     }
+    if (mustKeepLater) keepLater();
+    return std::nullopt;
   }
   // Call refuse() without the lock. It may end a flush, whose callback may send.
   publisher_.refuse(message);
   return error;
+}
+
+// Keeps the messages that wait for the first connection, if it takes long. The link's thread cannot
+// do that, because it is in the library until the attempt ends.
+void NatsLink::keepLater() {
+  dispatch_.asyncAfterOnBackgroundQueue(OutgoingQueue::kMemoryTime, [link = weak_from_this()] {
+    const auto self = link.lock();
+    if (!self) return;
+    {
+      const MutexLock lock(self->mutex_);
+      self->isKeptLater_ = false;
+      // From now on the thread does it.
+      if (self->hasConnection()) return;
+    }
+    if (self->publisher_.canKeep()) self->publisher_.keep();
+  });
 }
 
 bool NatsLink::close() {
@@ -141,7 +212,8 @@ bool NatsLink::close() {
   // If the thread hangs in the library, it holds the lock of the connection. Neither the thread nor
   // the connection can be destroyed then.
   if (!awaitThread()) {
-    kLog.notice("a NATS server does not answer; closing without it, unsent messages are dropped");
+    kLog.notice("a NATS server does not answer; closing without it, unsent messages are ",
+                publisher_.canKeep() ? "kept" : "dropped");
     giveUpRest();
     keepForEver();
     return false;
@@ -209,8 +281,10 @@ bool NatsLink::hasConnection() const {
   return state_ != State::kIdle && state_ != State::kConnecting;
 }
 
-// Returns true if a caller or a queued message needs a connection.
-bool NatsLink::isNeeded() { return !waiters_.empty() || publisher_.hasQueued(); }
+// Returns true if a caller or a message needs a connection.
+bool NatsLink::isNeeded() {
+  return !waiters_.empty() || isAttemptWanted_ || publisher_.hasUnsent();
+}
 
 // Returns true if close() was called and no work or no time remains.
 bool NatsLink::isAtEnd(Time now) {
@@ -228,10 +302,16 @@ NatsLink::Step NatsLink::nextStep(Time now) {
   if (const auto deadline = publisher_.firstDeadline(); deadline && now >= *deadline) {
     return Step::kAbandon;
   }
+  // Keep messages before connecting, too, because a kill must not lose them meanwhile.
+  if (const auto time = publisher_.keepTime(); time && now >= *time) return Step::kKeep;
   if (!hasConnection()) return now >= nextAttempt_ && isNeeded() ? Step::kConnect : Step::kWait;
-  if (state_ != State::kConnected) return Step::kWait;
+  return state_ == State::kConnected ? nextConnectedStep(now) : Step::kWait;
+}
+
+NatsLink::Step NatsLink::nextConnectedStep(Time now) {
   if (!waiters_.empty()) return Step::kAnswer;
-  return publisher_.canPublish(now) ? Step::kPublish : Step::kWait;
+  if (publisher_.canPublish(now)) return Step::kPublish;
+  return publisher_.mustRefill(now) ? Step::kRefill : Step::kWait;
 }
 
 // Returns the time at which nextStep() can return another step without any other change.
@@ -241,7 +321,11 @@ std::optional<NatsLink::Time> NatsLink::nextTime() {
     if (time) next = std::min(next.value_or(*time), *time);
   };
   consider(publisher_.firstDeadline());
-  if (state_ == State::kConnected) consider(publisher_.probeTime());
+  consider(publisher_.keepTime());
+  if (state_ == State::kConnected) {
+    consider(publisher_.probeTime());
+    consider(publisher_.refillTime());
+  }
   if (!hasConnection() && isNeeded()) consider(nextAttempt_);
   return next;
 }
@@ -284,8 +368,14 @@ bool NatsLink::perform(Step step) {
     case Step::kConnect:
       connect();
       break;
+    case Step::kKeep:
+      publisher_.keep();
+      break;
     case Step::kPublish:
       publisher_.publishNext();
+      break;
+    case Step::kRefill:
+      publisher_.refill();
       break;
     case Step::kAbandon:
       publisher_.abandonOverdue();

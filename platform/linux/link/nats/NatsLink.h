@@ -34,6 +34,9 @@ namespace halvox::platform::linux_ {
 // a server, and not before kAttemptPause has passed. An idle service without servers therefore
 // causes no wake-ups.
 //
+// With a spool, callers of discover() do not wait: their messages are kept until a server has them.
+// While messages wait, attempts go on, with pauses that grow to kLongestPause.
+//
 // An attempt cannot be cancelled, because the library holds the lock of its connection object
 // during the attempt. An attempt may never end, because the library sets no time limit for a TLS
 // handshake. close() therefore waits only for a bounded time. If the thread still hangs then,
@@ -50,6 +53,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   // The pause after a failed attempt. Bounds the load on the network when many sessions start while
   // no server answers.
   static constexpr std::chrono::seconds kAttemptPause{1};
+  static constexpr std::chrono::seconds kLongestPause{30};
   // How long close() waits for acknowledgements. Slow machines need more than one second.
   static constexpr std::chrono::seconds kCloseTime{3};
   // How long close() waits for an attempt that has begun. An attempt that takes longer usually
@@ -64,7 +68,10 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   NatsLink& operator=(const NatsLink&) = delete;
   ~NatsLink();  // calls close(), if the owner did not
 
-  // Calls `found` exactly once, and never before discover() returns. If a server is or gets
+  // Begins to send what earlier runs have kept in the spool. Call it once, before all others.
+  void resume() HALVOX_EXCLUDES(mutex_);
+  // Calls `found` exactly once, and never before discover() returns. If messages can be kept, calls
+  // it at once on the background queue, with the configured servers. If a server is or gets
   // connected, calls `found` with the servers' addresses on the link's thread. After a failed
   // attempt, calls it with std::nullopt on that thread. After kDiscoveryTime, calls it with
   // std::nullopt on the background queue.
@@ -74,7 +81,8 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   // library has ended and creating a message would crash.
   [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
   // Queues the message. Returns an error if the service is ending, the message is larger than the
-  // server accepts, the queue is full, or an attempt to connect failed within kAttemptPause.
+  // server accepts, or, without a spool, the queue is full or an attempt to connect failed within
+  // kAttemptPause. May wait for the store's queue, but never for a server.
   [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
   // Publishes queued messages for at most kCloseTime, then ends the connection and the library.
   // Returns false if the thread still runs. This object then exists until the process ends, and
@@ -97,9 +105,11 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   enum class Step : std::uint8_t {
     kWait,
     kCallBack,
+    kKeep,
     kAnswer,
     kConnect,
     kPublish,
+    kRefill,
     kAbandon,
     kDrop,
     kEnd
@@ -110,6 +120,9 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   // Returns false after the last step.
   [[nodiscard]] bool perform(Step step) HALVOX_EXCLUDES(mutex_);
   Step nextStep(Time now) HALVOX_REQUIRES(mutex_);
+  [[nodiscard]] bool discoverLater(TLMReportingService::BackendsCallback& found)
+      HALVOX_EXCLUDES(mutex_);
+  Step nextConnectedStep(Time now) HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool hasConnection() const HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool isNeeded() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool isAtEnd(Time now) HALVOX_REQUIRES(mutex_);
@@ -117,6 +130,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   void waitForChange() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] std::string provideThread() HALVOX_REQUIRES(mutex_);
   void wakeThread() HALVOX_REQUIRES(mutex_);
+  void keepLater() HALVOX_EXCLUDES(mutex_);
   void end() HALVOX_EXCLUDES(mutex_);
   [[nodiscard]] bool awaitThread() HALVOX_EXCLUDES(mutex_);
   void giveUpRest() HALVOX_EXCLUDES(mutex_);
@@ -150,7 +164,11 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   Time leaveBy_ HALVOX_GUARDED_BY(mutex_){};  // when close() stops waiting for the thread
   bool hasThreadEnded_ HALVOX_GUARDED_BY(mutex_) = false;
   Time nextAttempt_ HALVOX_GUARDED_BY(mutex_){};
-  std::string lastFailure_ HALVOX_GUARDED_BY(mutex_);  // empty when the last attempt succeeded
+  Time lastAttempt_ HALVOX_GUARDED_BY(mutex_){};  // when the last failed attempt ended
+  std::chrono::seconds attemptPause_ HALVOX_GUARDED_BY(mutex_) = kAttemptPause;
+  bool isKeptLater_ HALVOX_GUARDED_BY(mutex_) = false;      // the job of keepLater() has not run
+  bool isAttemptWanted_ HALVOX_GUARDED_BY(mutex_) = false;  // a session looked for servers
+  std::string lastFailure_ HALVOX_GUARDED_BY(mutex_);       // empty when the last attempt succeeded
   std::uint64_t lastWaiter_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::vector<Waiter> waiters_ HALVOX_GUARDED_BY(mutex_);
   std::vector<Answer> answers_ HALVOX_GUARDED_BY(mutex_);

@@ -164,6 +164,8 @@ void NatsLink::connect() {
     connection_ = std::move(connection);
     context_ = std::move(context);
     lastFailure_.clear();
+    attemptPause_ = kAttemptPause;
+    isAttemptWanted_ = false;
   }
   kLog.notice("connected to NATS");
   // Call onAvailable() here, because the library calls it only after a reconnection, not after the
@@ -171,22 +173,27 @@ void NatsLink::connect() {
   onAvailable(opened);
 }
 
-// Ends a failed attempt. Queued messages and waiting callers fail with it, because keeping them
-// would only delay their error.
+// Ends a failed attempt. Waiting callers fail with it, and so do queued messages if they cannot be
+// kept: their error would only come later.
 void NatsLink::failAttempt(const std::string& failure) {
+  publisher_.failQueued("no server");
   std::optional<std::uint64_t> worthALine;
+  std::string next = "when a session needs a server";
   {
     const MutexLock lock(mutex_);
     const Time now = std::chrono::steady_clock::now();
     endAttempt(State::kIdle);
     lastFailure_ = failure;
-    nextAttempt_ = now + kAttemptPause;
+    lastAttempt_ = now;
+    nextAttempt_ = now + attemptPause_;
+    isAttemptWanted_ = false;
+    if (publisher_.hasUnsent()) {
+      next = "in " + std::to_string(attemptPause_.count()) + " s; messages wait in the store";
+      attemptPause_ = std::min(2 * attemptPause_, kLongestPause);
+    }
     worthALine = attemptLog_.note(1, now);
   }
-  if (worthALine)
-    kLog.error("cannot connect to a NATS server: ", failure,
-               "; trying again when a session needs a server");
-  publisher_.failQueued("no server");
+  if (worthALine) kLog.error("cannot connect to a NATS server: ", failure, "; trying again ", next);
   answerWaiters();
 }
 
@@ -225,11 +232,12 @@ void NatsLink::dropConnection() {
     maxPayload_ = 0;
     servers_ = Array();
     isEnding = closeBy_.has_value();
+    publisher_.setOnline(false);
   }
   // Detach the publisher before closing the connection, because closing can hang until a server
   // answers.
   publisher_.detach();
-  if (isEnding) publisher_.failQueued("the service ended");
+  if (isEnding) publisher_.abandonAll();
   if (connection) natsConnection_Close(connection.get());
   context.reset();
   connection.reset();
@@ -246,6 +254,7 @@ void NatsLink::onAvailable(natsConnection* connection) {
   state_ = State::kConnected;
   servers_ = servers;
   maxPayload_ = static_cast<std::size_t>(std::max<std::int64_t>(maxPayload, 0));
+  publisher_.setOnline(true);
   changed_.notifyAll();
 }
 
@@ -257,6 +266,7 @@ void NatsLink::onAway(natsConnection* connection) {
     // Hold messages now, before the library reconnects. A message that is published after the
     // reconnection would otherwise overtake the messages that were sent but not acknowledged.
     publisher_.holdAfterLoss();
+    publisher_.setOnline(false);
     changed_.notifyAll();
   }
   kLog.notice("lost the connection to NATS; reconnecting; messages wait");
@@ -266,6 +276,7 @@ void NatsLink::onClosed(natsConnection* connection) {
   const MutexLock lock(mutex_);
   if (connection != connection_.get()) return;
   state_ = State::kLost;
+  publisher_.setOnline(false);
   changed_.notifyAll();
 }
 

@@ -6,7 +6,7 @@ namespace halvox::platform::linux_ {
 
 Result<std::unique_ptr<NatsTlmReporting>> loadNatsTlmReporting(const Configuration::Link& options,
                                                                const NatsEnvironment& environment) {
-  auto loaded = loadEntryPoint<decltype(halvox_link_nats_1)>(kNatsModule);
+  auto loaded = loadEntryPoint<decltype(halvox_link_nats_2)>(kNatsModule);
   if (!loaded) return std::move(loaded).error();
   return std::unique_ptr<NatsTlmReporting>((*loaded)(options, environment));
 }

@@ -11,8 +11,6 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
-constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
-
 // How many messages the publisher takes from the queue at a time. It takes them under the lock and
 // calls the library without the lock, because senders would otherwise wait while the library
 // writes.
@@ -43,52 +41,20 @@ bool isTemporary(natsStatus status, jsErrCode code = {}) {
 }  // namespace
 
 NatsPublisher::NatsPublisher(const Configuration::Link& options, StatisticsService& statistics,
-                             std::function<void()> wake)
+                             LinkSpool* spool, std::function<void()> wake)
     : options_(options),
       statistics_(statistics),
+      spool_(spool),
       wake_(std::move(wake)),
       received_(statistics_.counter(kNatsPiece, "received")),
       acknowledged_(statistics_.counter(kNatsPiece, "acknowledged")),
       notAcknowledged_(statistics_.counter(kNatsPiece, "not acknowledged")),
-      publishedAgain_(statistics_.counter(kNatsPiece, "published again")) {}
-
-std::optional<Error> NatsPublisher::take(OutgoingMessage& message) {
-  const MutexLock lock(mutex_);
-  if (queuedBytes_ + message.bytes > kQueueBytes) {
-    return refusedByLink("the queue to NATS is full: " + std::to_string(queue_.size()) +
-                         " messages wait for a server");
-  }
-  queuedBytes_ += message.bytes;
-  queue_.push_back(std::move(message));
-  return std::nullopt;
-}
-
-void NatsPublisher::refuse(const OutgoingMessage& message) {
-  statistics_.counter(kNatsPiece, "failed: refused").add();
-  if (message.ledger) message.ledger->resolve(message.number, AckOutcome::kRefused);
-}
+      publishedAgain_(statistics_.counter(kNatsPiece, "published again")),
+      queue_(spool, statistics) {}
 
 void NatsPublisher::beginEnd() {
   const MutexLock lock(mutex_);
   isEnding_ = true;
-}
-
-std::deque<OutgoingMessage> NatsPublisher::takeQueue() {
-  queuedBytes_ = 0;
-  return std::exchange(queue_, {});
-}
-
-void NatsPublisher::abandonAll() {
-  std::vector<PendingAcks::Entry> lost;
-  std::deque<OutgoingMessage> unsent;
-  {
-    const MutexLock lock(mutex_);
-    lost = pending_.takeAll();
-    unsent = takeQueue();
-  }
-  // Call these functions without the lock. They may end a flush, whose callback may send.
-  abandon(lost, "the connection ended");
-  fail(unsent, "the service ended");
 }
 
 void NatsPublisher::attach(jsCtx* context, std::chrono::nanoseconds duplicates) {
@@ -99,7 +65,6 @@ void NatsPublisher::attach(jsCtx* context, std::chrono::nanoseconds duplicates) 
 }
 
 void NatsPublisher::detach() {
-  std::vector<PendingAcks::Entry> lost;
   {
     const MutexLock lock(mutex_);
     // The state of the window and of the flow belongs to one connection. Reset both for the next
@@ -107,29 +72,14 @@ void NatsPublisher::detach() {
     isWindowFull_ = false;
     flow_ = Flow::kFlowing;
     isStreamInDoubt_ = false;
-    lost = pending_.takeAll();
   }
+  returnPending("the connection ended");
   context_ = nullptr;
-  abandon(lost, "the connection ended");
-}
-
-void NatsPublisher::failQueued(std::string_view reason) {
-  std::deque<OutgoingMessage> unsent;
-  {
-    const MutexLock lock(mutex_);
-    unsent = takeQueue();
-  }
-  fail(unsent, reason);
-}
-
-bool NatsPublisher::hasQueued() {
-  const MutexLock lock(mutex_);
-  return !queue_.empty();
 }
 
 bool NatsPublisher::isDone() {
   const MutexLock lock(mutex_);
-  return queue_.empty() && pending_.size() == 0;
+  return !queue_.hasNext() && pending_.size() == 0;
 }
 
 std::optional<NatsPublisher::Time> NatsPublisher::firstDeadline() {
@@ -160,7 +110,7 @@ NatsPublisher::Step NatsPublisher::nextStep(Time now) {
   // Check for messages to publish again before the queue, because new messages must not overtake
   // them.
   if (pending_.needsAgain()) return pending_.hasAgain() ? Step::kSend : Step::kWait;
-  return !queue_.empty() && !isWindowFull_ ? Step::kSend : Step::kWait;
+  return queue_.hasNext() && !isWindowFull_ ? Step::kSend : Step::kWait;
 }
 
 // Calls nextStep() again, because an acknowledgement may have arrived since canPublish().
@@ -189,15 +139,19 @@ std::vector<NatsMessage> NatsPublisher::takeSome() {
     taken.push_back(pending_.nextAgain());
   }
   publishedAgain_.add(taken.size());
-  const Time deadline = std::chrono::steady_clock::now() +
-                        std::chrono::duration_cast<std::chrono::steady_clock::duration>(ackTime_);
-  while (!queue_.empty() && taken.size() < kMessagesAtOnce && pending_.hasRoom() &&
+  const Time now = std::chrono::steady_clock::now();
+  const Time deadline =
+      now + std::chrono::duration_cast<std::chrono::steady_clock::duration>(ackTime_);
+  while (queue_.hasNext() && taken.size() < kMessagesAtOnce && pending_.hasRoom() &&
          !pending_.needsAgain()) {
-    OutgoingMessage& next = queue_.front();
-    queuedBytes_ -= next.bytes;
-    pending_.add(next.message.get(), {std::move(next.ledger), next.number, next.bytes, deadline});
+    OutgoingMessage next = queue_.takeNext();
+    pending_.add(next.message.get(), {.ledger = std::move(next.ledger),
+                                      .number = next.number,
+                                      .bytes = next.bytes,
+                                      .published = now,
+                                      .deadline = deadline,
+                                      .spooled = next.spooled});
     taken.push_back(std::move(next.message));
-    queue_.pop_front();
   }
   isWindowFull_ = !pending_.hasRoom();
   return taken;
@@ -315,6 +269,7 @@ void NatsPublisher::beginHolding(Time until) {
 }
 
 void NatsPublisher::abandonOverdue() {
+  if (spool_ != nullptr) return returnPending("no acknowledgement in time");
   std::vector<PendingAcks::Entry> overdue;
   {
     const MutexLock lock(mutex_);
@@ -339,6 +294,7 @@ void NatsPublisher::resolve(NatsMessage message, const jsPubAckErr* error) {
   {
     const MutexLock lock(mutex_);
     entry = pending_.take(message.get());
+    if (entry && entry->spooled != 0) queue_.settle(entry->spooled);
     // Free the message under the lock. When the link's thread sees that nothing is pending, it may
     // end the library, and the message must be destroyed before that.
     message.reset();
@@ -396,10 +352,6 @@ void NatsPublisher::fail(const std::deque<OutgoingMessage>& messages, std::strin
   for (const OutgoingMessage& message : messages) {
     if (message.ledger) message.ledger->resolve(message.number, AckOutcome::kFailed);
   }
-}
-
-Error refusedByLink(std::string description) {
-  return {.domain = std::string(kErrorDomain), .code = 1, .description = std::move(description)};
 }
 
 }  // namespace halvox::platform::linux_

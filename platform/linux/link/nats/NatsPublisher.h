@@ -16,17 +16,11 @@
 #include "platform/linux/link/nats/BurstLog.h"
 #include "platform/linux/link/nats/NatsHandles.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
+#include "platform/linux/link/nats/OutgoingMessage.h"
+#include "platform/linux/link/nats/OutgoingQueue.h"
 #include "platform/linux/link/nats/PendingAcks.h"
 
 namespace halvox::platform::linux_ {
-
-// A message that was not passed to the client library yet.
-struct OutgoingMessage {
-  NatsMessage message;
-  std::size_t bytes = 0;              // body and headers
-  std::shared_ptr<AckLedger> ledger;  // null when no flush waits for the message
-  AckLedger::Number number = 0;
-};
 
 // Publishes messages in order over a connection that NatsLink makes and ends. Counts every message:
 // received = acknowledged + not acknowledged + failed (by reason) + still waiting.
@@ -53,6 +47,11 @@ struct OutgoingMessage {
 // message without an acknowledgement within kAckTime of its first attempt is abandoned and counted
 // as not acknowledged.
 //
+// With a spool, nothing is abandoned. What has no acknowledgement in time goes back to the spool
+// and is published again later, over this or another connection or by the next run of the service.
+// The stream recognises the second copy for two minutes; after a longer outage, it can store a
+// message twice whose acknowledgement was lost.
+//
 // Threads: any, except for the functions from attach() to detach(), which are for the link's
 // thread. A thread of the library calls onAcknowledged(). Only the link's thread ever waits for a
 // server.
@@ -71,13 +70,9 @@ class NatsPublisher {
   static constexpr std::chrono::milliseconds kResendPause{100};
   // The pause between two lookups of the stream. A lookup costs a cluster more than a probe.
   static constexpr std::chrono::seconds kStreamCheckPause{2};
-  // The bytes that may wait while no server is connected. This is the size of the largest request
-  // of a client, and of about 37,000 ordinary messages (886 bytes with headers). With a larger
-  // queue, a session would get the error of a broken link later.
-  static constexpr std::size_t kQueueBytes = 32U << 20U;
 
-  // `wake` makes the link's thread look for work again.
-  NatsPublisher(const Configuration::Link& options, StatisticsService& statistics,
+  // `wake` makes the link's thread look for work again. `spool` may be null.
+  NatsPublisher(const Configuration::Link& options, StatisticsService& statistics, LinkSpool* spool,
                 std::function<void()> wake);
   NatsPublisher(const NatsPublisher&) = delete;
   NatsPublisher& operator=(const NatsPublisher&) = delete;
@@ -85,8 +80,15 @@ class NatsPublisher {
 
   // Counts a message that a session sends. Call it before the message is queued or refused.
   void countReceived() { received_.add(); }
-  // Queues the message and moves from it. If the queue is full, returns the error and leaves
-  // `message` unchanged.
+  // Any thread, without any lock. Returns true if messages are kept while no server is there.
+  [[nodiscard]] bool canKeep() const { return spool_ != nullptr && spool_->canKeep(); }
+  // Goes on with the messages that an earlier run has kept; see OutgoingQueue.
+  void resume(std::function<void()> stored) HALVOX_EXCLUDES(mutex_);
+  // Call it when a server was connected or lost.
+  void setOnline(bool isOnline) HALVOX_EXCLUDES(mutex_);
+  // Queues the message and moves from it. If the queue is full or the link has ended, returns the
+  // error and leaves `message` unchanged. Waits if the message goes into the spool while the
+  // store's queue is full.
   [[nodiscard]] std::optional<Error> take(OutgoingMessage& message) HALVOX_EXCLUDES(mutex_);
   // Counts a message that was not queued. Its sender gets the error from the caller.
   void refuse(const OutgoingMessage& message);
@@ -94,11 +96,13 @@ class NatsPublisher {
   // not, because with little traffic every acknowledgement is the last pending one and would wake
   // the thread for nothing.
   void beginEnd() HALVOX_EXCLUDES(mutex_);
-  // Abandons all queued and all unacknowledged messages.
+  // Abandons all queued and all unacknowledged messages, or gives them back to the spool. Refuses
+  // further ones.
   void abandonAll() HALVOX_EXCLUDES(mutex_);
 
-  [[nodiscard]] bool hasQueued() HALVOX_EXCLUDES(mutex_);
-  // Returns true if no message is queued or waits for its acknowledgement.
+  // Returns true if a message waits here or in the spool.
+  [[nodiscard]] bool hasUnsent() HALVOX_EXCLUDES(mutex_);
+  // Returns true if no message can be published now or waits for its acknowledgement.
   [[nodiscard]] bool isDone() HALVOX_EXCLUDES(mutex_);
   // Returns the time when the oldest unacknowledged message will be abandoned; std::nullopt if
   // there is none.
@@ -108,16 +112,28 @@ class NatsPublisher {
   // Returns true if publishNext() would publish now, provided that a server is connected.
   [[nodiscard]] bool canPublish(Time now) HALVOX_EXCLUDES(mutex_);
 
+  // Returns when keep() is due; std::nullopt if nothing must be kept.
+  [[nodiscard]] std::optional<Time> keepTime() HALVOX_EXCLUDES(mutex_);
+  // Returns true if refill() would read from the spool now, provided that a server is connected.
+  [[nodiscard]] bool mustRefill(Time now) HALVOX_EXCLUDES(mutex_);
+  // Returns when the next read after a failed one is due; std::nullopt if none failed.
+  [[nodiscard]] std::optional<Time> refillTime() HALVOX_EXCLUDES(mutex_);
+
   // The functions from here to detach() are for the link's thread only.
+  // Moves queued messages and copies of the published ones into the spool.
+  void keep() HALVOX_EXCLUDES(mutex_);
+  // Reads the next messages from the spool.
+  void refill() HALVOX_EXCLUDES(mutex_);
   // Publishes over `context` until detach(). The caller owns `context`. `duplicates` is the time
   // for which the stream recognises identifiers.
   void attach(jsCtx* context, std::chrono::nanoseconds duplicates);
   void publishNext() HALVOX_EXCLUDES(mutex_);
   void abandonOverdue() HALVOX_EXCLUDES(mutex_);
-  // Counts all queued messages as failed, for example because no server could be reached.
+  // Without a spool, counts all queued messages as failed, for example because no server could be
+  // reached. Otherwise they stay.
   void failQueued(std::string_view reason) HALVOX_EXCLUDES(mutex_);
-  // Call it when the connection has ended. Abandons all unacknowledged messages. Queued messages
-  // stay for the next connection.
+  // Call it when the connection has ended, before it is destroyed. Abandons all unacknowledged
+  // messages, or gives them back to the spool. Queued messages stay for the next connection.
   void detach() HALVOX_EXCLUDES(mutex_);
 
   // Any thread. Call it when the connection was lost. Unacknowledged messages will then be
@@ -148,10 +164,12 @@ class NatsPublisher {
       HALVOX_EXCLUDES(mutex_);
   void fail(const std::deque<OutgoingMessage>& messages, std::string_view reason)
       HALVOX_EXCLUDES(mutex_);
-  [[nodiscard]] std::deque<OutgoingMessage> takeQueue() HALVOX_REQUIRES(mutex_);
+  void returnPending(std::string_view reason) HALVOX_EXCLUDES(mutex_);
+  static void resolveKept(const OutgoingQueue::Kept& kept);
 
   const Configuration::Link& options_;  // owned by the NatsLink
   StatisticsService& statistics_;
+  LinkSpool* const spool_;
   const std::function<void()> wake_;
   Counter& received_;
   Counter& acknowledged_;
@@ -164,8 +182,8 @@ class NatsPublisher {
   bool isWindowFull_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isStreamInDoubt_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
-  std::deque<OutgoingMessage> queue_ HALVOX_GUARDED_BY(mutex_);
-  std::size_t queuedBytes_ HALVOX_GUARDED_BY(mutex_) = 0;
+  bool hasEnded_ HALVOX_GUARDED_BY(mutex_) = false;
+  OutgoingQueue queue_ HALVOX_GUARDED_BY(mutex_);
   PendingAcks pending_ HALVOX_GUARDED_BY(mutex_){AckWindow{}};
   BurstLog failureLog_ HALVOX_GUARDED_BY(mutex_);
   BurstLog holdLog_ HALVOX_GUARDED_BY(mutex_);
@@ -175,9 +193,7 @@ class NatsPublisher {
   std::chrono::nanoseconds ackTime_ = kAckTime;
   Time nextStreamCheck_{};
   BurstLog streamLog_;
+  BurstLog readLog_;
 };
-
-// Returns the error for the sender of a message that the link refuses.
-[[nodiscard]] Error refusedByLink(std::string description);
 
 }  // namespace halvox::platform::linux_

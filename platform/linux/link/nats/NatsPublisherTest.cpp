@@ -35,11 +35,11 @@ class NatsPublisherTest : public testing::Test {
   const Configuration::Link options_{};
   int wakes_ = 0;
   const std::shared_ptr<AckLedger> ledger_ = std::make_shared<AckLedger>();
-  NatsPublisher publisher_{options_, statistics_, [this] { ++wakes_; }};
+  NatsPublisher publisher_{options_, statistics_, nullptr, [this] { ++wakes_; }};
 };
 
 TEST_F(NatsPublisherTest, TakesMessagesUpToItsBoundInBytes) {
-  OutgoingMessage largest = messageOf(NatsPublisher::kQueueBytes);
+  OutgoingMessage largest = messageOf(OutgoingQueue::kQueueBytes);
   OutgoingMessage another = messageOf(1);
 
   EXPECT_FALSE(publisher_.take(largest).has_value());
@@ -52,7 +52,7 @@ TEST_F(NatsPublisherTest, TakesMessagesUpToItsBoundInBytes) {
 }
 
 TEST_F(NatsPublisherTest, TakesMessagesAgainAfterItsQueueFailed) {
-  OutgoingMessage largest = messageOf(NatsPublisher::kQueueBytes);
+  OutgoingMessage largest = messageOf(OutgoingQueue::kQueueBytes);
   ASSERT_FALSE(publisher_.take(largest).has_value());
 
   publisher_.failQueued("no server");
@@ -60,7 +60,7 @@ TEST_F(NatsPublisherTest, TakesMessagesAgainAfterItsQueueFailed) {
   EXPECT_TRUE(publisher_.isDone());
   EXPECT_EQ(counted("failed: no server"), 1U);
   EXPECT_EQ(flushed(), (AckTally{.acknowledged = 0, .notAcknowledged = 1}));
-  OutgoingMessage next = messageOf(NatsPublisher::kQueueBytes);
+  OutgoingMessage next = messageOf(OutgoingQueue::kQueueBytes);
   EXPECT_FALSE(publisher_.take(next).has_value());
 }
 
@@ -77,7 +77,7 @@ TEST_F(NatsPublisherTest, AbandonsTheQueueAtTheEnd) {
 
   publisher_.abandonAll();
 
-  EXPECT_FALSE(publisher_.hasQueued());
+  EXPECT_FALSE(publisher_.hasUnsent());
   EXPECT_EQ(counted("failed: the service ended"), 1U);
   EXPECT_EQ(flushed(), (AckTally{.acknowledged = 0, .notAcknowledged = 1}));
 }
@@ -88,7 +88,7 @@ TEST_F(NatsPublisherTest, KeepsItsQueueFromOneConnectionToTheNext) {
 
   publisher_.detach();
 
-  EXPECT_TRUE(publisher_.hasQueued());
+  EXPECT_TRUE(publisher_.hasUnsent());
   EXPECT_TRUE(publisher_.canPublish({}));
 }
 

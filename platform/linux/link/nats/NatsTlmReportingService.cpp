@@ -15,10 +15,6 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsTlmReportingService");
-constexpr const char* kMessageIdHeader = "Nats-Msg-Id";
-// About how many bytes the header adds to a message. Servers count the header as part of the
-// message's size.
-constexpr std::size_t kHeaderBytes = 80;
 
 // Each thread has its own encoder, because an encoder reuses its buffer.
 PayloadEncoder& encoder() {
@@ -99,6 +95,8 @@ NatsTlmReportingService::NatsTlmReportingService(Configuration::Link options,
 
 NatsTlmReportingService::~NatsTlmReportingService() { static_cast<void>(close()); }
 
+void NatsTlmReportingService::resume() { link_->resume(); }
+
 bool NatsTlmReportingService::close() { return link_->close(); }
 
 TLMReportingService::Token NatsTlmReportingService::TLMHierarchyTokenCreate() {
@@ -149,15 +147,10 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   append(id, lastMessage_.fetch_add(1, std::memory_order_relaxed) + 1);
 
   OutgoingMessage outgoing;
-  natsStatus status = natsMsg_Create(outgoing.message.out(), session.subject().c_str(), nullptr,
-                                     body.data(), static_cast<int>(body.size()));
-  if (status == NATS_OK) {
-    status = natsMsgHeader_Set(outgoing.message.get(), kMessageIdHeader, id.c_str());
-  }
+  const natsStatus status = makeMessage(session.subject().c_str(), id, body, outgoing);
   if (status != NATS_OK) {
     return {.sent = false, .error = Error{.description = natsStatus_GetText(status)}};
   }
-  outgoing.bytes = body.size() + kHeaderBytes;
   outgoing.ledger = session.ledger();
   // Add the message to the ledger before sending it, because its acknowledgement may arrive before
   // send() returns.
@@ -178,6 +171,9 @@ void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
         if (tally.notAcknowledged > 0) {
           kLog.error("flushed ", name, ": ", tally.acknowledged, " acknowledged, ",
                      tally.notAcknowledged, " not");
+        } else if (tally.kept > 0) {
+          kLog.info("flushed ", name, ": ", tally.acknowledged, " acknowledged, ", tally.kept,
+                    " kept in the store");
         } else {
           kLog.info("flushed ", name, ": ", tally.acknowledged, " acknowledged, 0 not");
         }

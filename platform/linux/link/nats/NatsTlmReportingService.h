@@ -38,6 +38,7 @@ class NatsTlmReportingService final : public NatsTlmReporting {
   TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary& sessionInfo,
                                                  const Dictionary& userInfo,
                                                  const TLMReportingMessage& message) override;
+  void resume() override;
   [[nodiscard]] bool close() override;
 
  private:

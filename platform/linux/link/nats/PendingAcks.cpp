@@ -10,12 +10,22 @@ std::optional<PendingAcks::Time> PendingAcks::firstDeadline() const {
   return slots_.front().entry.deadline;
 }
 
-void PendingAcks::add(const natsMsg* message, Entry entry) {
-  atLibrary_.insert_or_assign(message, first_ + slots_.size());
+std::optional<PendingAcks::Time> PendingAcks::firstUnspooled() const {
+  for (std::uint64_t number = std::max(unspooled_, first_); number < end(); ++number) {
+    const Slot& slot = slots_[number - first_];
+    if (!slot.isSettled) return slot.entry.published;
+  }
+  return std::nullopt;
+}
+
+void PendingAcks::add(natsMsg* message, Entry entry) {
+  atLibrary_.insert_or_assign(message, end());
   ++size_;
   bytes_ += entry.bytes;
-  slots_.push_back({.entry = std::move(entry)});
-  again_ = first_ + slots_.size();
+  const bool isSpooled = entry.spooled != 0;
+  slots_.push_back({.entry = std::move(entry), .message = message});
+  again_ = end();
+  if (isSpooled) unspooled_ = end();
 }
 
 PendingAcks::Entry PendingAcks::settle(Slot& slot) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
@@ -11,6 +12,7 @@
 
 #include "platform/linux/link/nats/AckLedger.h"
 #include "platform/linux/link/nats/NatsHandles.h"
+#include "platform/linux/store/spool/LinkSpool.h"
 
 namespace halvox::platform::linux_ {
 
@@ -34,10 +36,12 @@ class PendingAcks {
  public:
   using Time = std::chrono::steady_clock::time_point;
   struct Entry {
-    std::shared_ptr<AckLedger> ledger;  // null when no flush waits for it
+    std::shared_ptr<AckLedger> ledger{};  // null when no flush waits for it
     AckLedger::Number number = 0;
     std::size_t bytes = 0;
-    Time deadline;  // never earlier than that of an older message
+    Time published{};
+    Time deadline{};                // never earlier than that of an older message
+    LinkSpool::Number spooled = 0;  // its number in the spool; 0 if the spool does not have it
   };
 
   explicit PendingAcks(AckWindow window) : window_(window) {}
@@ -54,8 +58,9 @@ class PendingAcks {
   // Returns the deadline of the oldest message; std::nullopt if there is none.
   [[nodiscard]] std::optional<Time> firstDeadline() const;
 
-  // Call only while needsAgain() is false.
-  void add(const natsMsg* message, Entry entry);
+  // Call only while needsAgain() is false. The library may own the message, but must not destroy it
+  // before it is taken.
+  void add(natsMsg* message, Entry entry);
   // Removes a message whose outcome the library has reported. Returns std::nullopt if it was
   // removed before as overdue.
   std::optional<Entry> take(const natsMsg* message);
@@ -73,6 +78,20 @@ class PendingAcks {
   // hasAgain().
   NatsMessage nextAgain();
 
+  // Calls `spool` with each message that the spool does not have, oldest first. It must return the
+  // message's number in the spool.
+  template <typename Spool>
+  void forEachUnspooled(Spool spool) {
+    for (std::uint64_t number = std::max(unspooled_, first_); number < end(); ++number) {
+      Slot& slot = slots_[number - first_];
+      if (!slot.isSettled) slot.entry.spooled = spool(slot.message);
+    }
+    unspooled_ = end();
+  }
+  // Returns when the oldest message that the spool does not have was published; std::nullopt if
+  // there is none.
+  [[nodiscard]] std::optional<Time> firstUnspooled() const;
+
   // Removes and returns the messages whose deadline has passed, oldest first.
   std::vector<Entry> takeOverdue(Time now);
   std::vector<Entry> takeAll() { return takeOverdue(Time::max()); }
@@ -80,10 +99,12 @@ class PendingAcks {
  private:
   struct Slot {
     Entry entry;
+    natsMsg* message = nullptr;  // exists until the slot is settled
     NatsMessage held{};
     bool isSettled = false;  // a settled slot stays until all older ones are settled
   };
 
+  [[nodiscard]] std::uint64_t end() const { return first_ + slots_.size(); }
   Entry settle(Slot& slot);
   void skipSettled();
 
@@ -91,6 +112,9 @@ class PendingAcks {
   std::deque<Slot> slots_;
   std::uint64_t first_ = 0;  // number of the first slot
   std::uint64_t again_ = 0;  // number of the next slot to publish again; one past the last if none
+  // The first slot after all messages that the spool has. Later slots are of messages that it does
+  // not have.
+  std::uint64_t unspooled_ = 0;
   std::unordered_map<const natsMsg*, std::uint64_t> atLibrary_;
   std::size_t size_ = 0;   // of unsettled slots
   std::size_t bytes_ = 0;  // of unsettled slots

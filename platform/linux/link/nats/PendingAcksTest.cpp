@@ -1,5 +1,7 @@
 #include "platform/linux/link/nats/PendingAcks.h"
 
+#include <vector>
+
 #include <gtest/gtest.h>
 
 namespace halvox::platform::linux_ {
@@ -134,6 +136,38 @@ TEST_F(PendingAcksTest, TakingAllLeavesAnEmptyWindow) {
 
   EXPECT_TRUE(pending.hasRoom());
   EXPECT_EQ(pending.size(), 0U);
+}
+
+TEST_F(PendingAcksTest, KnowsTheOldestMessageThatTheSpoolDoesNotHave) {
+  EXPECT_FALSE(pending.firstUnspooled().has_value());
+  pending.add(one.get(), {.bytes = 1, .published = at(1), .spooled = 8});
+  EXPECT_FALSE(pending.firstUnspooled().has_value());
+  pending.add(two.get(), {.bytes = 1, .published = at(2)});
+  pending.add(three.get(), {.bytes = 1, .published = at(3)});
+  EXPECT_EQ(pending.firstUnspooled(), at(2));
+
+  EXPECT_TRUE(pending.take(two.get()).has_value());
+
+  EXPECT_EQ(pending.firstUnspooled(), at(3));
+}
+
+TEST_F(PendingAcksTest, GivesEachMessageToTheSpoolOnce) {
+  pending.add(one.get(), {.bytes = 1, .spooled = 8});
+  pending.add(two.get(), {.bytes = 1});
+  pending.add(three.get(), {.bytes = 1});
+  EXPECT_TRUE(pending.take(three.get()).has_value());
+  std::vector<natsMsg*> spooled;
+  const auto spool = [&spooled](natsMsg* message) {
+    spooled.push_back(message);
+    return LinkSpool::Number{9};
+  };
+
+  pending.forEachUnspooled(spool);
+  pending.forEachUnspooled(spool);
+
+  EXPECT_EQ(spooled, std::vector<natsMsg*>{two.get()});
+  EXPECT_FALSE(pending.firstUnspooled().has_value());
+  EXPECT_EQ(pending.take(two.get())->spooled, 9U);
 }
 
 }  // namespace

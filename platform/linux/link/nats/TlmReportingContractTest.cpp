@@ -26,6 +26,7 @@
 #include "platform/linux/link/nats/NatsHandles.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/store/spool/testing/FakeLinkSpool.h"
 #include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
@@ -116,6 +117,8 @@ FakePlatform& neighbours() {
   return *platform;
 }
 
+// With or without a spool, in which the first messages wait here for the connection.
+template <bool kHasSpool>
 class NatsHarness {
  public:
   static constexpr bool kFindsBackends = true;
@@ -125,16 +128,21 @@ class NatsHarness {
 
   NatsHarness() {
     if (!isAvailable()) return;
-    static int lastStream = 0;
+    static int lastStream = kHasSpool ? 1000 : 0;
     linux_::Configuration::Link options;
     options.servers = {NatsServer::shared()->url()};
     options.stream = "CONTRACT" + std::to_string(++lastStream);
     options.subject = "contract" + std::to_string(lastStream);
     stream_ = options.stream;
-    link_ = linux_::makeNatsTlmReporting(options, {dispatch_, statistics_});
+    link_ = linux_::makeNatsTlmReporting(options,
+                                         {dispatch_, statistics_, kHasSpool ? &spool_ : nullptr});
+    link_->resume();
   }
   ~NatsHarness() {
     if (link_ == nullptr) return;
+    // The server reserves disk space for each stream, and has not enough for those of all tests.
+    if (!reader_) connect();
+    static_cast<void>(js_DeleteStream(reader_.get(), stream_.c_str(), nullptr, nullptr));
     reader_.reset();
     connection_.reset();
     dispatch_.stop(std::chrono::seconds(5));
@@ -147,7 +155,13 @@ class NatsHarness {
   static bool letRunUntil(const std::function<bool()>& condition) { return eventually(condition); }
   std::vector<std::int64_t> arrived() {
     if (!reader_) connect();
-    while (readNext()) {
+    // Ask for messages only when there are some: the server crashes if it is asked for a message of
+    // a stream that is being created.
+    linux_::JetStreamInfo info;
+    const natsStatus status =
+        js_GetStreamInfo(info.out(), reader_.get(), stream_.c_str(), nullptr, nullptr);
+    const std::uint64_t messages = status == NATS_OK ? info.get()->State.Msgs : 0;
+    while (arrived_.size() < messages && readNext()) {
     }
     return arrived_;
   }
@@ -173,6 +187,7 @@ class NatsHarness {
   }
 
   linux_::CounterStatisticsService statistics_;
+  linux_::FakeLinkSpool spool_;
   linux_::AsioDispatchService dispatch_{neighbours().log, statistics_};
   std::string stream_;
   std::unique_ptr<linux_::NatsTlmReporting> link_;
@@ -183,6 +198,7 @@ class NatsHarness {
 
 }  // namespace
 
-INSTANTIATE_TYPED_TEST_SUITE_P(Nats, TlmReportingContract, NatsHarness);
+INSTANTIATE_TYPED_TEST_SUITE_P(Nats, TlmReportingContract, NatsHarness<false>);
+INSTANTIATE_TYPED_TEST_SUITE_P(NatsWithSpool, TlmReportingContract, NatsHarness<true>);
 
 }  // namespace halvox::platform::contract
