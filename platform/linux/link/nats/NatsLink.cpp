@@ -16,6 +16,17 @@ constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 // need longer, one of them hangs.
 constexpr std::chrono::milliseconds kLibraryEndTime{2000};
 constexpr std::int64_t kDefaultSpin = -1;  // how long the library spins on its locks
+
+// Returns an address without its user name and password. Sessions log the addresses.
+std::string withoutUser(std::string_view server) {
+  const std::size_t scheme = server.find("://");
+  const std::size_t user = server.rfind('@');
+  if (scheme == std::string_view::npos || user == std::string_view::npos) {
+    return std::string(server);
+  }
+  return std::string(server.substr(0, scheme + 3)) + std::string(server.substr(user + 1));
+}
+
 }  // namespace
 
 NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environment)
@@ -62,8 +73,7 @@ bool NatsLink::discoverLater(TLMReportingService::BackendsCallback& found) {
     // Callers that find a connection get its servers, which may have named others.
     if (closeBy_ || state_ == State::kConnected || !publisher_.canKeep()) return false;
     std::vector<Value> values;
-    for (const std::string& server : options_.servers)
-      values.emplace_back(std::string_view(server));
+    for (const std::string& server : options_.servers) values.emplace_back(withoutUser(server));
     servers = Array(std::span<const Value>(values));
     isAttemptWanted_ = true;
     nextAttempt_ = std::min(nextAttempt_, lastAttempt_ + kAttemptPause);
@@ -314,8 +324,9 @@ NatsLink::Step NatsLink::nextConnectedStep(Time now) {
   return publisher_.mustRefill(now) ? Step::kRefill : Step::kWait;
 }
 
-// Returns the time at which nextStep() can return another step without any other change.
-std::optional<NatsLink::Time> NatsLink::nextTime() {
+// Returns the time at which nextStep() can return another step without any other change, if it has
+// just returned kWait for `now`.
+std::optional<NatsLink::Time> NatsLink::nextTime(Time now) {
   std::optional<Time> next = closeBy_;
   const auto consider = [&next](std::optional<Time> time) {
     if (time) next = std::min(next.value_or(*time), *time);
@@ -324,15 +335,16 @@ std::optional<NatsLink::Time> NatsLink::nextTime() {
   consider(publisher_.keepTime());
   if (state_ == State::kConnected) {
     consider(publisher_.probeTime());
-    consider(publisher_.refillTime());
+    // A read that is due already waits for something else, such as acknowledgements.
+    if (const auto time = publisher_.refillTime(); time && *time > now) consider(time);
   }
   if (!hasConnection() && isNeeded()) consider(nextAttempt_);
   return next;
 }
 
-void NatsLink::waitForChange() {
+void NatsLink::waitForChange(Time now) {
   isIdle_ = true;
-  if (const auto time = nextTime()) {
+  if (const auto time = nextTime(now)) {
     changed_.waitUntil(mutex_, *time);
   } else {
     changed_.wait(mutex_);
@@ -346,8 +358,9 @@ void NatsLink::run() {
     Step step = Step::kWait;
     {
       const MutexLock lock(mutex_);
-      step = nextStep(std::chrono::steady_clock::now());
-      if (step == Step::kWait) waitForChange();
+      const Time now = std::chrono::steady_clock::now();
+      step = nextStep(now);
+      if (step == Step::kWait) waitForChange(now);
     }
     // Perform the step without the lock, because most steps call the library and some wait for a
     // server.

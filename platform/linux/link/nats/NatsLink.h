@@ -126,8 +126,8 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   [[nodiscard]] bool hasConnection() const HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool isNeeded() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool isAtEnd(Time now) HALVOX_REQUIRES(mutex_);
-  std::optional<Time> nextTime() HALVOX_REQUIRES(mutex_);
-  void waitForChange() HALVOX_REQUIRES(mutex_);
+  std::optional<Time> nextTime(Time now) HALVOX_REQUIRES(mutex_);
+  void waitForChange(Time now) HALVOX_REQUIRES(mutex_);
   [[nodiscard]] std::string provideThread() HALVOX_REQUIRES(mutex_);
   void wakeThread() HALVOX_REQUIRES(mutex_);
   void keepLater() HALVOX_EXCLUDES(mutex_);

@@ -41,6 +41,8 @@ std::optional<Error> OutgoingQueue::take(OutgoingMessage& message, PendingAcks& 
     const std::optional<Time> time = keepTime(pending);
     if (canKeep() && (isFull || (time && now >= *time))) keep(pending, kept);
   }
+  // The store would drop the message. What it has kept before precedes those that wait in memory.
+  if (mode_ == Mode::kSpool && !canKeep()) mode_ = Mode::kCatchingUp;
   if (mode_ == Mode::kSpool) return takeIntoSpool(message, kept);
   if (isFull) {
     return refusedByLink("the queue to NATS is full: " + std::to_string(memory_.size()) +
@@ -160,6 +162,7 @@ void OutgoingQueue::settle(LinkSpool::Number number) {
 void OutgoingQueue::rewind() {
   if (spool_ == nullptr) return;
   readThrough_ = settledThrough();
+  readAfterStored_.reset();
   inFlight_.clear();
   read_.clear();
   // This may be the end of the process. The next one must not send again what was acknowledged.

@@ -216,6 +216,17 @@ TEST_F(OutgoingQueueTest, WhileTheStoreFailsMessagesWaitInMemory) {
   EXPECT_THAT(publishAll(), ElementsAre("1", "2"));
 }
 
+TEST_F(OutgoingQueueTest, AStoreThatBeginsToFailGetsNoFurtherMessages) {
+  loseServer();
+  take(1);
+  spool_.setCanKeep(false);
+  take(2);
+  EXPECT_THAT(spool_.identifiers(), ElementsAre("1"));
+  queue_.setOnline(true);
+
+  EXPECT_THAT(readAll(), ElementsAre("1", "2"));
+}
+
 TEST_F(OutgoingQueueTest, AFlushNeedNotWaitForAKeptMessage) {
   const auto ledger = std::make_shared<AckLedger>();
   loseServer();
