@@ -57,6 +57,9 @@ std::string linkReasons(const MessageTally& tally) {
   add(LinkFate::kRepeats,
       "Dropped by the session, because they repeat the message of the same category and type that "
       "it recorded before");
+  add(LinkFate::kMayRepeat,
+      "Dropped by a session, because they repeat what it recorded before, or sent by a session "
+      "without a link; the store does not show which");
   add(LinkFate::kEqualsEvent,
       "Equal to the event before, which has no link message either (a session that recorded that "
       "one dropped them)");
@@ -86,6 +89,7 @@ Sink linkSink(const MessageTally& tally, const ExplainSettings& settings) {
             .record = count.newest,
             .why = linkReasons(tally)};
   const bool isOpen = tally.link(LinkFate::kNotRecognised).messages > 0 ||
+                      tally.link(LinkFate::kMayRepeat).messages > 0 ||
                       tally.link(LinkFate::kEqualsEvent).messages > 0 ||
                       tally.link(LinkFate::kWithoutStamp).messages > 0;
   if (count.messages == 0 && isOpen) sink.took = Took::kUnknown;
@@ -215,6 +219,10 @@ std::string linkWhy(const MessageFate& fate) {
       return (fate.session ? "Session " + std::to_string(*fate.session)
                            : std::string("One of several sessions")) +
              " dropped it: it repeats record " + std::to_string(fate.previous) + ".";
+    case LinkFate::kMayRepeat:
+      return "It equals record " + std::to_string(fate.previous) +
+             ", which a session with a link recorded. Either that session dropped it, or a session "
+             "without a link sent it: the store does not show which.";
     case LinkFate::kEqualsEvent:
       return "It equals record " + std::to_string(fate.previous) +
              ", which did not go through the link either.";

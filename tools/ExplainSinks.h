@@ -25,7 +25,7 @@ struct MessageTally {
       newest = record;
     }
   };
-  static constexpr std::size_t kLinkFates = 7;
+  static constexpr std::size_t kLinkFates = 8;
 
   std::uint64_t messages = 0;
   Count common;     // recorded as the event of all services

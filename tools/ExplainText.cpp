@@ -137,6 +137,11 @@ std::vector<std::string> repetitionSentences(const MessageFate& fate) {
         "before it, apart from hvreporting_timestamp, systemuptime_sec and "
         "processuptime_ms. Sessions drop such a message, however long ago the other "
         "one came. Its events are recorded all the same.");
+  } else if (fate.link == LinkFate::kMayRepeat) {
+    sentences.push_back(
+        "It equals record " + std::to_string(fate.previous) +
+        ", which a session recorded. That session dropped it as a repetition, unless "
+        "another session, which has no link, sent it.");
   } else if (fate.equalsPrevious) {
     sentences.push_back("It equals record " + std::to_string(fate.previous) +
                         ", the message of the same category, type, application and service type "

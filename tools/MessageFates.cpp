@@ -64,7 +64,9 @@ void MessageFates::add(const Message& message) {
   Base& base = baseOf(message);
   if (content) decide(message, *content, base, fate);
   callback_(fate);
-  const bool isRecorded = fate.link == LinkFate::kSession || fate.link == LinkFate::kNotRecognised;
+  const bool isRecorded = fate.link == LinkFate::kSession ||
+                          fate.link == LinkFate::kNotRecognised ||
+                          fate.link == LinkFate::kMayRepeat;
   if (content && isRecorded) {
     keep(base, {.id = message.id, .session = message.sessionID, .message = *content});
   }
@@ -100,6 +102,13 @@ void MessageFates::decide(const Message& message, const Dictionary& content, con
     fate.session = kept->session;
     fate.link = kept->session ? LinkFate::kRepeats : LinkFate::kEqualsEvent;
     if (fate.link == LinkFate::kEqualsEvent) break;
+  }
+  // A session without a link has sent another such message. It would record this one, because it
+  // differs from its own, and the two cases look the same.
+  const bool hasOther = std::ranges::any_of(base, [](const Kept& one) { return !one.session; });
+  if (fate.link == LinkFate::kRepeats && hasOther) {
+    fate.link = LinkFate::kMayRepeat;
+    fate.session.reset();
   }
   // Whether it was dropped as a repetition does not matter then.
   if (message.service == kTestService) fate.link = LinkFate::kTestSession;

@@ -20,6 +20,7 @@ enum class LinkFate : std::uint8_t {
   kSession,        // the link took it in a session
   kSingle,         // the link took it outside a session
   kRepeats,        // no link message: it repeats a message that a session recorded before
+  kMayRepeat,      // no link message: it repeats one as above, or a session without a link sent it
   kEqualsEvent,    // no link message: it equals the event before it, of which there is none either
   kTestSession,    // no link message: sessions of that type do not use the link
   kWithoutStamp,   // its event and its link message cannot be brought together
@@ -30,7 +31,7 @@ struct MessageFate {
   const analysis::Message& message;  // valid during the callback only
   LinkFate link = LinkFate::kNotRecognised;
   // That took it, or that recorded the one that it repeats. Empty if the store does not show it: of
-  // a repetition, if several sessions recorded an equal message.
+  // a repetition, if several sessions recorded an equal message; always of kMayRepeat.
   std::optional<std::int64_t> session{};
   // The message of the same category, type, application and service type with which it was
   // compared; 0 if there is none.

@@ -101,6 +101,17 @@ TEST_F(MessageFatesTest, WhichOfTwoSessionsDroppedARepetitionIsNotKnown) {
   EXPECT_EQ(previous_, 2);
 }
 
+TEST_F(MessageFatesTest, AMessageThatASessionWithoutALinkMayHaveSentIsNotSaidToBeDropped) {
+  fateOf(linked(R"("n":1)", 7));
+  EXPECT_EQ(fateOf(event(R"("n":2)")), LinkFate::kNotRecognised);
+
+  EXPECT_EQ(fateOf(event(R"("n":1)")), LinkFate::kMayRepeat);
+  EXPECT_EQ(session_, std::nullopt);
+  EXPECT_EQ(previous_, 1);
+  EXPECT_EQ(fateOf(event(R"("n":1)")), LinkFate::kEqualsEvent)
+      << "whoever recorded the one before drops this one";
+}
+
 TEST_F(MessageFatesTest, AnEqualMessageThatASessionRecordedNeverthelessIsNotSaidToDiffer) {
   fateOf(linked(R"("n":1)"));
   fateOf(linked(R"("n":1)"));  // the service was killed between the two
