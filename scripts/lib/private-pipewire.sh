@@ -101,13 +101,15 @@ halvox_audio_enter() {
 halvox_audio_bus_answers() {
   dbus-send --session --print-reply --dest=org.freedesktop.DBus / org.freedesktop.DBus.GetId
 }
-halvox_audio_pipewire_answers() { pw-cli info 0; }
+# A tool that has just connected waits forever if PipeWire ends at that moment.
+halvox_audio_ask() { timeout 5 "$@" </dev/null; }
+halvox_audio_pipewire_answers() { halvox_audio_ask pw-cli info 0; }
 
 # Whether WirePlumber links streams to the sink. A sink becomes the default when it has ports, and
 # this one gets them from WirePlumber, after the scripts that link streams have been loaded. With
 # adapter.auto-port-config it would have ports from the start, would be the default too early, and a
 # stream that came then would be refused with "no node available".
-halvox_audio_has_default_sink() { pw-dump | grep -q '"default.audio.sink"'; }
+halvox_audio_has_default_sink() { halvox_audio_ask pw-dump | grep -q '"default.audio.sink"'; }
 
 # Waits for what the process just started must do: DIRECTORY WHAT SECONDS COMMAND. Shows all logs if
 # it does not.

@@ -1,6 +1,7 @@
 """Cycles that a player misses on purpose: who was late, who suffered, and how many there were."""
 
 import contextlib
+import dataclasses
 import time
 import unittest
 
@@ -10,9 +11,27 @@ from harness import Service, require, wait_for
 FRAMES = 8192
 RATE = 48000
 # PipeWire reports its cycles once a second, and the reporter sends at most one report a second.
-SETTLED = 2.5
+SETTLED = 3
 STALL = 1.5
 CULPRIT, VICTIMS = "culprit", ("victim-a", "victim-b")
+
+
+@dataclasses.dataclass
+class Moment:
+    """The reports by the name of the node, and the cycles, until a moment when no report is due."""
+
+    reports: dict
+    cycles: list
+
+    def reports_since(self, before):
+        return {name: own[len(before.reports[name]):] for name, own in self.reports.items()}
+
+    def xruns_since(self, before):
+        return self.cycles[-1][1] - before.cycles[-1][1]
+
+    def late_since(self, before):
+        """The cycles in which a node was late."""
+        return [cycle for cycle in self.cycles[len(before.cycles):] if cycle[2]]
 
 
 @unittest.skipIf(audio.missing(), audio.missing())
@@ -34,7 +53,7 @@ class GlitchTest(unittest.TestCase):
             self.players[name] = audio.Player(self.audio, name, FRAMES)
             stack.callback(self.players[name].stop)
         self.serials = wait_for("the three streams to start", self.started_serials)
-        self.wait_until_settled(time.monotonic())
+        self.before = wait_for("cycles without a glitch", self.settled, 120)
 
     def messages(self, name):
         """The payloads of the messages with that name, oldest first."""
@@ -45,18 +64,6 @@ class GlitchTest(unittest.TestCase):
         serials = [start["object_serial"] for start in self.messages("Session_Playback.Start")]
         return serials if len(serials) == 3 else None
 
-    def missed(self, since):
-        """The cycles that the profiler shows as missed since that time."""
-        return [cycle for cycle in self.profile.cycles() if cycle[2] and cycle[0] > since * 1e9]
-
-    def wait_until_settled(self, since):
-        """Waits until cycles run and were not missed for so long that all reports were sent."""
-        def settled():
-            now = time.monotonic()
-            last = self.profile.cycles()[-1][0] / 1e9 if self.profile.cycles() else 0
-            return last > since + SETTLED and not self.missed(now - SETTLED - 1)
-        wait_for("cycles without a glitch", settled, 120)
-
     def reports(self):
         """The reports of missed cycles by the name of the node, oldest first."""
         reports = {name: [] for name in self.players}
@@ -64,21 +71,44 @@ class GlitchTest(unittest.TestCase):
             reports[issue["node"]].append(issue)
         return reports
 
+    def glitches_between(self, begin, end):
+        """Whether a node or the device missed a cycle between the two times of the profile."""
+        cycles = self.profile.cycles()
+        return any(late or xruns > cycles[place][1]
+                   for place, (when, xruns, late) in enumerate(cycles[1:]) if begin < when <= end)
+
+    def settled(self):
+        """The present moment, or nothing when a report may be due: the machine may be so busy
+        that cycles are missed at any time."""
+        begin = time.monotonic_ns()
+        self.wait_for_cycle_after(begin + SETTLED * 1_000_000_000)
+        reports, end = self.reports(), time.monotonic_ns()
+        self.wait_for_cycle_after(end)
+        if self.glitches_between(begin, end):
+            return None
+        return Moment(reports, [cycle for cycle in self.profile.cycles() if cycle[0] <= end])
+
+    def wait_for_cycle_after(self, moment):
+        wait_for("the profile to go on",
+                 lambda: (cycles := self.profile.cycles()) and cycles[-1][0] > moment)
+
+    def begin_stall(self, seconds, least):
+        """Lets the culprit stall and waits until the profiler shows at least that many cycles."""
+        self.players[CULPRIT].stall(seconds)
+        wait_for("the stall to be profiled", lambda: len(
+            Moment({}, self.profile.cycles()).late_since(self.before)) >= least)
+
     def stall(self):
         """Lets the culprit stall. Returns the missed cycles, the xruns and the reports of that."""
-        before, since = self.reports(), time.monotonic()
-        self.players[CULPRIT].stall(STALL)
         # The last cycle may be cut short by the end of the stall.
-        least = int(STALL * RATE / FRAMES) - 2
-        wait_for("the stall to be profiled", lambda: len(self.missed(since)) >= least)
-        self.wait_until_settled(time.monotonic())
+        self.begin_stall(STALL, int(STALL * RATE / FRAMES) - 2)
+        return self.outcome()
 
-        cycles = self.profile.cycles()
-        earlier = [xruns for when, xruns, _ in cycles if when <= since * 1e9][-1]
-        return self.missed(since), cycles[-1][1] - earlier, self.reports_since(before)
-
-    def reports_since(self, before):
-        return {name: reports[len(before[name]):] for name, reports in self.reports().items()}
+    def outcome(self):
+        """The missed cycles, the xruns and the reports since the streams ran without a glitch."""
+        after = wait_for("cycles without a glitch", self.settled, 120)
+        return (after.late_since(self.before), after.xruns_since(self.before),
+                after.reports_since(self.before))
 
     def check_shares(self, missed, reports):
         """Each stream reports all cycles that the device missed."""
@@ -140,14 +170,12 @@ class GlitchTest(unittest.TestCase):
 
     def test_an_xrun_of_the_device_is_shared_by_all_streams_that_ran_on_it(self):
         self.run_streams(counts_xruns=True)
-        before, xruns = self.reports(), self.profile.cycles()[-1][1]
 
         self.audio.cause_xrun()
-        self.wait_until_settled(time.monotonic())
 
-        counted = self.profile.cycles()[-1][1] - xruns
+        _, counted, reports = self.outcome()
         self.assertGreater(counted, 0)
-        for name, own in self.reports_since(before).items():
+        for name, own in reports.items():
             self.assertEqual(sum(report["missed_cycles"] for report in own), counted, name)
             # A busy machine may make a player late as well.
             self.assertIn(("device", "demo-speakers"),
@@ -155,16 +183,13 @@ class GlitchTest(unittest.TestCase):
 
     def test_a_culprit_that_is_killed_while_it_stalls_is_still_named(self):
         self.run_streams(counts_xruns=False)
-        before, since = self.reports(), time.monotonic()
-        self.players[CULPRIT].stall(60)
-        wait_for("the stall to be profiled", lambda: len(self.missed(since)) > 2)
+        self.begin_stall(60, 3)
 
         self.players[CULPRIT].kill()
-        self.wait_until_settled(time.monotonic())
 
-        reports = self.reports_since(before)
+        missed, _, reports = self.outcome()
         # Its last second is lost with it, because the profiler reports late.
-        self.check_shares(self.missed(since), {name: reports[name] for name in VICTIMS})
+        self.check_shares(missed, {name: reports[name] for name in VICTIMS})
         self.check_roles(reports)
 
     def test_the_shares_add_up_on_a_driver_that_counts_no_xruns(self):
