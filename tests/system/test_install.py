@@ -96,6 +96,7 @@ class SystemFilesTest(Installation):
                      "share/dbus-1/system.d/com.tarno.halvox.reporting.conf",
                      "share/dbus-1/system-services/com.tarno.halvox.reporting.service",
                      f"share/dbus-1/interfaces/{INTERFACE}.xml",
+                     "share/dbus-1/interfaces/com.tarno.halvox.Connection.xml",
                      "share/dbus-1/interfaces/com.tarno.halvox.Statistics.xml",
                      "share/dbus-1/interfaces/com.tarno.halvox.Storage.xml",
                      "share/bash-completion/completions/halvoxctl",
@@ -131,19 +132,24 @@ class SystemFilesTest(Installation):
 class InterfaceFileTest(Installation):
     """The interface files, which have names and comments, and the service's own answer agree."""
 
-    INTERFACES = (INTERFACE, "com.tarno.halvox.Statistics", "com.tarno.halvox.Storage")
+    INTERFACES = (INTERFACE, "com.tarno.halvox.Connection", "com.tarno.halvox.Statistics",
+                  "com.tarno.halvox.Storage")
 
     def file(self, interface=INTERFACE):
         return self.prefix / f"share/dbus-1/interfaces/{interface}.xml"
 
-    def methods(self, document, interface):
-        interface, = [found for found in ElementTree.fromstring(document).iter("interface")
-                      if found.get("name") == interface]
-        return [(method.get("name"),
-                 [(argument.get("type"), argument.get("direction")) for argument in method.iter("arg")])
-                for method in interface.iter("method")]
+    def members(self, document, interface=None):
+        """The methods and signals of one interface or of all."""
+        return [member for found in ElementTree.fromstring(document).iter("interface")
+                if interface in (None, found.get("name"))
+                for member in found if member.tag in ("method", "signal")]
 
-    def test_the_methods_are_those_that_the_service_shows(self):
+    def types(self, document, interface):
+        return [(member.tag, member.get("name"),
+                 [(argument.get("type"), argument.get("direction")) for argument in member.iter("arg")])
+                for member in self.members(document, interface)]
+
+    def test_the_methods_and_signals_are_those_that_the_service_shows(self):
         with Service() as service:
             client = Client.to_socket(service.address)
             self.addCleanup(client.close)
@@ -152,17 +158,18 @@ class InterfaceFileTest(Installation):
                 0, int(harness.DEADLINE * 1000), None).unpack()
 
         for interface in self.INTERFACES:
-            self.assertEqual(self.methods(self.file(interface).read_text(), interface),
-                             self.methods(answer, interface))
+            described = self.types(self.file(interface).read_text(), interface)
+            self.assertGreater(len(described), 0, interface)
+            self.assertEqual(described, self.types(answer, interface))
 
     def test_each_argument_has_a_name_and_a_description(self):
         for interface in self.INTERFACES:
             text = self.file(interface).read_text()
-            for method in ElementTree.fromstring(text).iter("method"):
-                comment = re.search(rf"<!-- {method.get('name')}:(.*?)-->", text, re.DOTALL)
-                self.assertIsNotNone(comment, method.get("name"))
+            for member in self.members(text):
+                comment = re.search(rf"<!-- {member.get('name')}:(.*?)-->", text, re.DOTALL)
+                self.assertIsNotNone(comment, member.get("name"))
                 described = re.findall(r"@(\w+):", comment[1])
-                self.assertEqual(described, [argument.get("name") for argument in method.iter("arg")])
+                self.assertEqual(described, [argument.get("name") for argument in member.iter("arg")])
 
     def test_a_generator_makes_code_and_pages_from_them(self):
         harness.require("gdbus-codegen")

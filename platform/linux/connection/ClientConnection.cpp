@@ -120,6 +120,7 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
   // Only method calls are answered.
   if (request.type != dbus::MessageType::kMethodCall) return;
   host_.statistics().requestsReceived.add();
+  setLastRequest(request.serial);
   refuse(request, Refusal::kTooLarge, error_names::kLimitsExceeded,
          "the message has " + std::to_string(next.totalBytes) + " bytes; the limit is " +
              std::to_string(host_.options().maxFrameBytes));

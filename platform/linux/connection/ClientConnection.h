@@ -66,6 +66,10 @@ class ClientConnection : public NSXPCConnection,
   // Releases everything without calling the handlers. Called if the delegate refuses the connection
   // and when the service ends.
   void abandon();
+  // The serial of the last request that was delivered or refused; 0 before the first one. The
+  // dispatcher sets it.
+  [[nodiscard]] std::uint32_t lastRequest() const { return lastRequest_; }
+  void setLastRequest(std::uint32_t serial) { lastRequest_ = serial; }
 
   // These functions are for the code that answers requests.
   [[nodiscard]] std::uint64_t number() const { return number_; }
@@ -141,6 +145,7 @@ class ClientConnection : public NSXPCConnection,
   State state_ = State::kNotResumed;
   Why why_ = Why::kClosedHere;
   bool saidHello_ = false;
+  std::uint32_t lastRequest_ = 0;
   std::uint32_t loggedRefusals_ = 0;  // one bit for each Refusal that was logged
   std::uint64_t unloggedRefusals_ = 0;
 };

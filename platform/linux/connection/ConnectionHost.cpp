@@ -157,6 +157,7 @@ void ConnectionHost::resume() {
   watchdog_.start();
   while (!stopping_) takeTurn();
   static_cast<void>(sd_notify(0, "STOPPING=1\nSTATUS=Completing the requests that were read"));
+  for (const auto& [key, peer] : peers_) peer->sayGoodbye();
   shutDown();
 }
 

@@ -1,6 +1,7 @@
 #include "platform/linux/connection/Introspection.h"
 
 #include "platform/linux/connection/StandardInterfaces.h"
+#include "platform/linux/connection/wire/EndedSignal.h"
 #include "platform/linux/connection/wire/Signature.h"
 
 namespace halvox::platform::linux_ {
@@ -53,6 +54,15 @@ void appendStandardInterfaces(std::string& xml, bool isObject) {
   if (!open.empty()) xml += " </interface>\n";
 }
 
+void appendConnectionInterface(std::string& xml) {
+  openInterface(xml, dbus::kConnectionInterface);
+  xml += "  <signal name=\"";
+  xml += dbus::kEndedSignal;
+  xml += "\">\n   <arg type=\"";
+  xml += dbus::kEndedSignature;
+  xml += "\"/>\n  </signal>\n </interface>\n";
+}
+
 // `path` is a parent of the object. Returns the name of its only child, which is the next element
 // of `objectPath`.
 std::string_view childOf(std::string_view path, std::string_view objectPath) {
@@ -68,6 +78,7 @@ std::string introspectionOf(const NSXPCInterface& interface, std::string_view pa
   xml += "<node>\n";
   appendStandardInterfaces(xml, isObject);
   if (isObject) {
+    appendConnectionInterface(xml);
     openInterface(xml, interface.name);
     for (const InterfaceMethod& method : interface.methods) appendMethod(xml, method);
     xml += " </interface>\n";

@@ -1,6 +1,7 @@
 #include <array>
 #include <chrono>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include <gmock/gmock.h>
@@ -54,6 +55,41 @@ TEST(LifecycleTest, RefusedConnectionIsClosedWithoutHandlers) {
   EXPECT_TRUE(client.isClosedByService());
   EXPECT_EQ(service.count("connections refused"), 1U);
   EXPECT_TRUE(service.delegate.events().empty());
+}
+
+// Returns the number in the signal of an orderly end; nothing if the connection ends without it.
+std::optional<std::uint64_t> lastRequestInGoodbye(RawClient& client) {
+  while (const auto answer = client.receive()) {
+    if (answer->type == dbus::MessageType::kSignal) return answer->values.at(0).toUInt64();
+  }
+  return std::nullopt;
+}
+
+TEST(LifecycleTest, AnOrderlyEndTellsAClientItsLastRequestThatWasTaken) {
+  ServiceUnderTest service;
+  RawClient client(service.socketPath());
+  client.authenticate();
+  client.send(client.callWithText("echo", "a"));
+  client.send(client.callWithText("echo", "b"));
+  client.send(client.callWithText("noSuchMethod", "c"));
+  for (int answers = 0; answers < 3; ++answers) ASSERT_TRUE(client.receive().has_value());
+
+  service.stop();
+
+  EXPECT_EQ(lastRequestInGoodbye(client), client.lastSerial());
+  EXPECT_TRUE(client.isClosedByService());
+}
+
+TEST(LifecycleTest, AnOrderlyEndTellsAClientWithoutRequestsThatNoneWasTaken) {
+  ServiceUnderTest service;
+  RawClient client(service.socketPath());
+  client.authenticate();
+  ASSERT_TRUE(eventually([&] { return service.count("connections accepted") == 1U; }));
+  client.send(withoutReply(client.callWithText("echo", "a")).substr(0, 20));
+
+  service.stop();
+
+  EXPECT_EQ(lastRequestInGoodbye(client), 0U);
 }
 
 TEST(LifecycleTest, RequestsSentBeforeTheClientWentAwayAreDelivered) {

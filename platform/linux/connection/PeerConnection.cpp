@@ -1,9 +1,12 @@
 #include "platform/linux/connection/PeerConnection.h"
 
+#include <span>
 #include <utility>
 
 #include "platform/linux/connection/ConnectionHost.h"
 #include "platform/linux/connection/ConnectionLog.h"
+#include "platform/linux/connection/wire/EndedSignal.h"
+#include "platform/linux/connection/wire/FrameWriter.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -96,6 +99,22 @@ void PeerConnection::onDeadline() {
               inHandshake ? "its handshake" : "a message that it has begun");
   host().statistics().connectionsTimedOut.add();
   end(Why::kClosedHere);
+}
+
+void PeerConnection::sayGoodbye() {
+  const NSXPCInterface* exported = exportedInterface();
+  if (handshake_ != nullptr || hasEnded() || exported == nullptr) return;
+  const Value last(std::uint64_t{lastRequest()});
+  const dbus::CallTarget sender{.destination = {},
+                                .path = exported->objectPath,
+                                .interface = dbus::kConnectionInterface,
+                                .member = dbus::kEndedSignal};
+  if (!dbus::appendSignal(stream_.output().bytes(), stream_.nextSerial(), sender,
+                          dbus::kEndedSignature, std::span(&last, 1))) {
+    return;
+  }
+  // Do not call frameAppended(), because this is no reply.
+  stream_.flush();
 }
 
 void PeerConnection::onEnded() {

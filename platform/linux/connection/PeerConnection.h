@@ -31,6 +31,10 @@ class PeerConnection final : public ClientConnection, private StreamOwner, priva
   void start();
   [[nodiscard]] std::string description() const override;
   [[nodiscard]] bool isPeerToPeer() const override { return true; }
+  // Tells the client that the service ends, and which of its requests was the last that the service
+  // has taken. The client can then send the later ones to the next service, none of them twice.
+  // Called at an orderly end, before abandon(). Does not wait for a client whose socket is full.
+  void sayGoodbye();
 
  private:
   FrameBuffer& input() override { return stream_.input(); }

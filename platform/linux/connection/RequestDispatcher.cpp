@@ -90,6 +90,7 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
     return;
   }
   statistics_.requestsReceived.add();
+  client.setLastRequest(header.serial);
   const Request request{.client = client, .frame = frame, .frameBytes = frameBytes};
   if (request.isForExportedObject()) {
     const NSXPCInterface& exported = *client.exportedInterface();

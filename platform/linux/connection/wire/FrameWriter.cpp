@@ -44,6 +44,13 @@ class FrameBuilder {
     encoder_.appendText(text);
   }
 
+  void addTarget(const CallTarget& target) {
+    addPath(target.path);
+    addText(HeaderField::kInterface, target.interface);
+    addText(HeaderField::kMember, target.member);
+    addText(HeaderField::kDestination, target.destination);
+  }
+
   // Adds the last field, ends the header and appends the body.
   bool finish(std::string_view signature, std::span<const Value> values) {
     // An empty body needs no signature: without this field, D-Bus assumes an empty body.
@@ -163,10 +170,15 @@ bool appendMethodCall(std::string& out, std::uint32_t serial, const CallTarget& 
                       std::string_view signature, std::span<const Value> arguments) {
   if (!isValid(target, serial)) return false;
   FrameBuilder frame(out, MessageType::kMethodCall, 0, serial);
-  frame.addPath(target.path);
-  frame.addText(HeaderField::kInterface, target.interface);
-  frame.addText(HeaderField::kMember, target.member);
-  frame.addText(HeaderField::kDestination, target.destination);
+  frame.addTarget(target);
+  return frame.finish(signature, arguments);
+}
+
+bool appendSignal(std::string& out, std::uint32_t serial, const CallTarget& target,
+                  std::string_view signature, std::span<const Value> arguments) {
+  if (!isValid(target, serial) || target.interface.empty()) return false;
+  FrameBuilder frame(out, MessageType::kSignal, kNoReplyExpected, serial);
+  frame.addTarget(target);
   return frame.finish(signature, arguments);
 }
 

@@ -22,7 +22,8 @@ struct ReplyTo {
   std::string_view destination;
 };
 
-// The target of a call. `destination` and `interface` may be empty.
+// The target of a call. `destination` and `interface` may be empty. For a signal: its sender's
+// object and its receiver; the interface must not be empty.
 struct CallTarget {
   std::string_view destination;
   std::string_view path;
@@ -52,5 +53,9 @@ struct CallTarget {
 [[nodiscard]] bool appendMethodCall(std::string& out, std::uint32_t serial,
                                     const CallTarget& target, std::string_view signature,
                                     std::span<const Value> arguments);
+
+// A signal. `signature` has one complete type for each argument.
+[[nodiscard]] bool appendSignal(std::string& out, std::uint32_t serial, const CallTarget& target,
+                                std::string_view signature, std::span<const Value> arguments);
 
 }  // namespace halvox::platform::linux_::dbus
