@@ -237,6 +237,8 @@ bool ClientWorker::isEnding() {
 
 bool ClientWorker::mayFallAsleep() {
   nap_ = {};
+  // A write has failed since the worker last looked at the connection. Nothing would end the sleep.
+  if (state_ != State::kAbsent && !stream_.isOpen()) return false;
   if (!isWindowOpen()) return true;  // the socket or the deadline ends the sleep, not a producer
   nap_ = napLength();
   // Announce the sleep before looking at the ring for the last time. Either a producer sees the
@@ -250,7 +252,8 @@ bool ClientWorker::mayFallAsleep() {
 
 std::chrono::milliseconds ClientWorker::napLength() const {
   const auto quiet = std::chrono::steady_clock::now() - lastMessage_;
-  const bool mayBeWoken = !options_.isRealTime || made_.running() == 0;
+  const bool isRunning = made_.running() > 0 || !openOperations_.empty();
+  const bool mayBeWoken = !options_.isRealTime || !isRunning;
   if (mayBeWoken && quiet >= kNapsAfterMessage) return {};
   const auto share = std::chrono::duration_cast<std::chrono::milliseconds>(quiet / kNapShare);
   return std::clamp(share, kShortestNap, kLongestNap);
@@ -304,14 +307,25 @@ void ClientWorker::giveUpWaitingIfOverflowed() {
     made_ = wanted_;
     end = ring_.tail();
   }
-  while (ring_.head() < end && ring_.isReady()) {
-    ring_.take(nullptr);
-    lost_.fetch_add(1, std::memory_order_release);
+  for (const Untaken& untaken : std::exchange(untaken_, {})) {
+    const auto* frame = std::get_if<FrameRing::FrameNumber>(&untaken);
+    if (frame != nullptr) giveUpMessage(*frame);
   }
+  while (ring_.head() < end && ring_.isReady()) giveUpMessage(ring_.take());
   ring_.release();
+  // Their results are in made_ now.
+  for (OpenCall& call : open_) {
+    if (call.kind == OpenCall::Kind::kOperation) call.kind = OpenCall::Kind::kOther;
+  }
+  openOperations_.clear();
   // The discarded operations may have changed any session. Connect again: a new connection makes
   // all sessions in their latest state.
   if (state_ != State::kAbsent) loseConnection();
+}
+
+void ClientWorker::giveUpMessage(FrameRing::FrameNumber frame) {
+  ring_.drop(frame);
+  lost_.fetch_add(1, std::memory_order_release);
 }
 
 }  // namespace halvox::client

@@ -55,6 +55,12 @@ namespace halvox::client {
 // request. At any time only the thread that holds `turn_` does the worker's work. Only the worker's
 // thread ends the connection and calls the connection handler.
 //
+// A message keeps its frame in the ring until it is answered. A service that ends in an orderly way
+// says which call was the last one that it has taken. The next service then gets the sessions as
+// they were after that call, and after that all later operations and messages again. If the service
+// ends without that word, nobody knows which of the open calls it has carried out. Their messages
+// count as lost, because a message may be missing but must never arrive twice.
+//
 // If the lane overflows (kMaxWaitingOperations) because there is no service, the worker discards
 // the operations in the lane and the waiting messages, which count as lost. After the next
 // connection, it makes the sessions in their latest state.
@@ -91,14 +97,18 @@ class ClientWorker {
     std::variant<SessionOperation, FlushTicket> step;
   };
   // A call that the service has not answered, or an answered call after such a call. The call of a
-  // flush therefore stays here until all calls before it are answered.
+  // flush therefore stays here until all calls before it are answered. The calls that make sessions
+  // again are of the kind kOther.
   struct OpenCall {
-    enum class Kind : std::uint8_t { kOperation, kMessage, kFlush };
-    Kind kind = Kind::kOperation;
+    enum class Kind : std::uint8_t { kOther, kOperation, kMessage, kFlush };
+    Kind kind = Kind::kOther;
     bool isAnswered = false;
     std::uint32_t bytes = 0;
+    FrameRing::FrameNumber frame = 0;  // of a message that is not answered
     FlushTicket flush = 0;
   };
+  // What a service that ended in an orderly way has not taken.
+  using Untaken = std::variant<SessionOperation, FrameRing::FrameNumber>;
 
   template <typename Content>
   bool push(const BasicMessageView<Content>& message);
@@ -123,6 +133,7 @@ class ClientWorker {
   bool receive();
   void onReady();
   void loseConnection();
+  void settleOpenCalls();
   void pauseBeforeRetry();
   void retryNow();
   void notifyConnection(bool connected);
@@ -134,15 +145,19 @@ class ClientWorker {
   void sendAll();
   bool sendNext();
   void sendFromLane();
-  void sendOperation(const SessionOperation& operation);
+  void sendUntaken();
+  void sendOperation(SessionOperation operation);
+  bool sendStep(const SessionOperation& operation, OpenCall::Kind kind);
   void sendFlush(FlushTicket ticket);
-  void sendMessageAtHead();
+  void sendMessage(FrameRing::FrameNumber frame);
   void numberCall(char* frame, const OpenCall& call);
-  void numberWithoutAnswer(char* frame);
+  void numberWithoutAnswer(char* frame, const OpenCall& call);
   void giveUpWaitingIfOverflowed();
+  void giveUpMessage(FrameRing::FrameNumber frame);
 
   // Receiving.
   bool takeAnswers();
+  void takeLastAnswers();
   void onAnswer(const Answer& answer);
   void finishFlushes();
 
@@ -191,9 +206,15 @@ class ClientWorker {
   TimePoint samePlaceUntil_{};  // until then no other place is tried
   std::chrono::milliseconds pause_;
   bool everConnected_ = false;
-  SessionTable made_;                      // after all operations that were sent
-  std::deque<SessionOperation> remaking_;  // sent before anything from the ring and the lane
+  // The sessions after all operations that are no longer in `openOperations_`.
+  SessionTable made_;
+  std::deque<SessionOperation> openOperations_;  // of the calls of the kind kOperation in `open_`
+  // These three are sent before anything from the ring and the lane, in this order.
+  std::deque<SessionOperation> remaking_;
+  std::deque<Untaken> untaken_;
   std::deque<FlushTicket> interruptedFlushes_;
+  // The last call that the service has taken, if it has said that it ends; 0: it has taken none.
+  std::optional<std::uint32_t> lastTaken_;
   TimePoint lastMessage_{};           // when a message was last taken out of the ring
   std::chrono::milliseconds nap_{0};  // the next nap; 0: sleep until woken
   bool readable_ = false;             // the socket may have bytes to read, or have been closed

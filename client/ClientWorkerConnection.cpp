@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <iterator>
 #include <utility>
 
 #include "client/ClientWorker.h"
@@ -21,8 +22,13 @@ constexpr std::size_t kReopenAtBytes = kMaxOpenBytes / 2;
 // The client keeps track of the calls from the oldest unanswered one to the newest. If there are
 // more than this, it considers the service broken and closes the connection.
 constexpr std::size_t kMostTrackedCalls = std::size_t{1} << 16U;
-// After this many sent messages, their cells in the ring are released for the producers.
-constexpr int kReleaseAfter = 64;
+
+// Returns true if the call with that serial was not sent after the last one that the service has
+// taken.
+bool isTaken(std::uint32_t serial, std::uint32_t lastTaken) {
+  // Serials start again at 1 after the largest one. The difference is small in either direction.
+  return lastTaken != 0 && static_cast<std::int32_t>(lastTaken - serial) >= 0;
+}
 
 }  // namespace
 
@@ -56,6 +62,7 @@ void ClientWorker::processStream() {
   const bool alive =
       stream_.isOpen() && stream_.send() && (!std::exchange(readable_, false) || receive());
   if (!alive || open_.size() > kMostTrackedCalls) {
+    takeLastAnswers();
     loseConnection();
   } else if (state_ == State::kConnecting) {
     if (stream_.isReady()) {
@@ -82,17 +89,45 @@ void ClientWorker::onReady() {
   notifyConnection(true);
 }
 
-void ClientWorker::loseConnection() {
+// Decides for each open call whether its work is done, lost, or to be sent to the next service.
+void ClientWorker::settleOpenCalls() {
+  const std::optional<std::uint32_t> lastTaken = std::exchange(lastTaken_, std::nullopt);
+  std::deque<Untaken> untaken;
   std::deque<FlushTicket> flushes;
-  for (const auto& call : open_) {
-    if (call.kind == OpenCall::Kind::kMessage && !call.isAnswered) {
-      lost_.fetch_add(1, std::memory_order_release);
+  std::uint32_t serial = lastSerial_ - static_cast<std::uint32_t>(open_.size());
+  for (const OpenCall& call : open_) {
+    ++serial;
+    const bool isUntaken = lastTaken.has_value() && !isTaken(serial, *lastTaken);
+    if (call.kind == OpenCall::Kind::kFlush) {
+      flushes.push_back(call.flush);
+    } else if (call.kind == OpenCall::Kind::kOperation) {
+      if (isUntaken) {
+        untaken.emplace_back(std::move(openOperations_.front()));
+      } else {
+        made_.apply(openOperations_.front());
+      }
+      openOperations_.pop_front();
+    } else if (call.kind == OpenCall::Kind::kMessage && !call.isAnswered) {
+      if (isUntaken) {
+        untaken.emplace_back(call.frame);
+      } else if (lastTaken.has_value()) {
+        ring_.drop(call.frame);
+        acknowledged_.fetch_add(1, std::memory_order_release);
+      } else {
+        giveUpMessage(call.frame);
+      }
     }
-    if (call.kind == OpenCall::Kind::kFlush) flushes.push_back(call.flush);
   }
+  untaken_.insert(untaken_.begin(), std::move_iterator(untaken.begin()),
+                  std::move_iterator(untaken.end()));
   interruptedFlushes_.insert(interruptedFlushes_.begin(), flushes.begin(), flushes.end());
-  stream_ = {};
   open_.clear();
+  ring_.release();
+}
+
+void ClientWorker::loseConnection() {
+  settleOpenCalls();
+  stream_ = {};
   unanswered_ = 0;
   openBytes_ = 0;
   windowIsOpen_ = true;
@@ -144,12 +179,9 @@ void ClientWorker::updateWindow() {
 
 void ClientWorker::sendAll() {
   const std::uint64_t before = ring_.head();
-  for (int count = 1; isWindowOpen() && sendNext(); ++count) {
-    if (count % kReleaseAfter == 0) ring_.release();
-  }
-  ring_.release();
+  while (isWindowOpen() && sendNext()) continue;
   if (ring_.head() != before) lastMessage_ = std::chrono::steady_clock::now();
-  // Ignore a failure here. The worker notices it when it next looks at the connection.
+  // Ignore a failure here. The worker looks at the connection again before it sleeps.
   if (stream_.isOpen()) stream_.send();
 }
 
@@ -157,7 +189,11 @@ bool ClientWorker::sendNext() {
   if (!remaking_.empty()) {
     const SessionOperation operation = std::move(remaking_.front());
     remaking_.pop_front();
-    sendOperation(operation);
+    sendStep(operation, OpenCall::Kind::kOther);
+    return true;
+  }
+  if (!untaken_.empty()) {
+    sendUntaken();
     return true;
   }
   if (!interruptedFlushes_.empty()) {
@@ -172,7 +208,7 @@ bool ClientWorker::sendNext() {
   if (lanePosition_.load(std::memory_order_acquire) <= ring_.head()) {
     sendFromLane();
   } else if (hasMessage) {
-    sendMessageAtHead();
+    sendMessage(ring_.take());
   } else {
     return false;
   }
@@ -193,27 +229,42 @@ void ClientWorker::sendFromLane() {
     sendFlush(*ticket);
     return;
   }
-  const auto& operation = std::get<SessionOperation>(entry.step);
-  // Apply the operation to made_ before sending it. If the connection ends now, the operation is
-  // then repeated on the next connection.
-  made_.apply(operation);
-  sendOperation(operation);
+  sendOperation(std::move(std::get<SessionOperation>(entry.step)));
 }
 
-void ClientWorker::sendOperation(const SessionOperation& operation) {
+void ClientWorker::sendUntaken() {
+  Untaken untaken = std::move(untaken_.front());
+  untaken_.pop_front();
+  if (const auto* frame = std::get_if<FrameRing::FrameNumber>(&untaken)) {
+    sendMessage(*frame);
+  } else {
+    sendOperation(std::move(std::get<SessionOperation>(untaken)));
+  }
+}
+
+void ClientWorker::sendOperation(SessionOperation operation) {
+  // Keep the operation before sending it, because an operation without an answer is complete at
+  // once.
+  openOperations_.push_back(std::move(operation));
+  if (!sendStep(openOperations_.back(), OpenCall::Kind::kOperation)) openOperations_.pop_back();
+}
+
+// Returns false for an operation that has no form on the wire.
+bool ClientWorker::sendStep(const SessionOperation& operation, OpenCall::Kind kind) {
   Request request = makeRequest(operation);
   // This fails only for a configuration that cannot be encoded for the wire. Drop it, because
   // trying again would not help.
   auto* frame = std::get_if<std::string>(&request);
-  if (frame == nullptr) return;
+  if (frame == nullptr) return false;
   if (std::holds_alternative<StartSession>(operation.step)) {
     // The service answers a start only at the stop. The client does not wait for that, and asks the
     // service not to answer.
-    numberWithoutAnswer(frame->data());
+    numberWithoutAnswer(frame->data(), {.kind = kind});
   } else {
-    numberCall(frame->data(), {});
+    numberCall(frame->data(), {.kind = kind});
   }
   stream_.append(*frame);
+  return true;
 }
 
 void ClientWorker::sendFlush(FlushTicket ticket) {
@@ -224,12 +275,15 @@ void ClientWorker::sendFlush(FlushTicket ticket) {
   stream_.append(frame);
 }
 
-void ClientWorker::sendMessageAtHead() {
-  const std::size_t bytes = kMessageHeaderBytes + ring_.frontBytes();
-  char* frame = stream_.append(bytes);
-  putMessageHeader(frame, ring_.frontBytes());
-  ring_.take(frame + kMessageHeaderBytes);
-  numberCall(frame, {.kind = OpenCall::Kind::kMessage, .bytes = static_cast<std::uint32_t>(bytes)});
+void ClientWorker::sendMessage(FrameRing::FrameNumber frame) {
+  const std::size_t bodyBytes = ring_.bytesOf(frame);
+  const std::size_t bytes = kMessageHeaderBytes + bodyBytes;
+  char* const whole = stream_.append(bytes);
+  putMessageHeader(whole, bodyBytes);
+  ring_.copy(frame, whole + kMessageHeaderBytes);
+  numberCall(whole, {.kind = OpenCall::Kind::kMessage,
+                     .bytes = static_cast<std::uint32_t>(bytes),
+                     .frame = frame});
 }
 
 void ClientWorker::numberCall(char* frame, const OpenCall& call) {
@@ -244,8 +298,8 @@ void ClientWorker::numberCall(char* frame, const OpenCall& call) {
   updateWindow();
 }
 
-void ClientWorker::numberWithoutAnswer(char* frame) {
-  numberCall(frame, {});
+void ClientWorker::numberWithoutAnswer(char* frame, const OpenCall& call) {
+  numberCall(frame, call);
   setNoReplyExpected(frame);
   --unanswered_;
   open_.back().isAnswered = true;
@@ -259,6 +313,7 @@ bool ClientWorker::takeAnswers() {
     switch (next.state) {
       case NextFrame::State::kIncomplete:
         finishFlushes();
+        ring_.release();
         return true;
       case NextFrame::State::kBroken:
         stream_.end();
@@ -266,11 +321,21 @@ bool ClientWorker::takeAnswers() {
       case NextFrame::State::kAnswer:
         onAnswer(next.answer);
         break;
+      case NextFrame::State::kEnded:
+        lastTaken_ = next.lastRequest;
+        stream_.end();
+        return false;
       case NextFrame::State::kOther:
         break;
     }
     stream_.consume(next.bytes);
   }
+}
+
+// Takes what the service sent before it closed the connection.
+void ClientWorker::takeLastAnswers() {
+  if (state_ != State::kReady || lastTaken_.has_value()) return;
+  while (stream_.receiveRest() && takeAnswers()) continue;
 }
 
 void ClientWorker::onAnswer(const Answer& answer) {
@@ -283,6 +348,7 @@ void ClientWorker::onAnswer(const Answer& answer) {
   openBytes_ -= call.bytes;
   pause_ = options_.reconnectMin;  // the service works
   if (call.kind == OpenCall::Kind::kMessage) {
+    ring_.drop(call.frame);
     (answer.isError ? refused_ : acknowledged_).fetch_add(1, std::memory_order_release);
   }
   updateWindow();
@@ -291,7 +357,12 @@ void ClientWorker::onAnswer(const Answer& answer) {
 void ClientWorker::finishFlushes() {
   FlushTicket done = 0;
   while (!open_.empty() && open_.front().isAnswered) {
-    done = std::max(done, open_.front().flush);
+    const OpenCall& call = open_.front();
+    done = std::max(done, call.flush);
+    if (call.kind == OpenCall::Kind::kOperation) {
+      made_.apply(openOperations_.front());
+      openOperations_.pop_front();
+    }
     open_.pop_front();
   }
   if (done == 0) return;

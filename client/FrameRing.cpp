@@ -180,37 +180,49 @@ bool FrameRing::takeList() {
   return true;
 }
 
-void FrameRing::take(char* to) {
-  const FrameHead head = headOf(oldest_);
-  CellNumber number = std::exchange(oldest_, head.neighbour);
-  if (taken_.first == kNoCell) {
-    taken_.first = number;
-  } else {
-    next(taken_.last).store(number, std::memory_order_relaxed);
-  }
-  const char* from = cell(number) + sizeof head;
-  std::size_t rest = head.bytes;
-  for (;;) {
-    const std::size_t part =
-        std::min(rest, static_cast<std::size_t>(cell(number) + kCellBytes - from));
-    if (to != nullptr) {
-      std::memcpy(to, from, part);
-      to += part;
-    }
-    rest -= part;
-    if (rest == 0) break;
-    number = next(number).load(std::memory_order_relaxed);
-    from = cell(number);
-  }
-  taken_.last = number;
+FrameRing::FrameNumber FrameRing::take() {
   ++head_;
+  return std::exchange(oldest_, headOf(oldest_).neighbour);
+}
+
+template <typename OnPart>
+FrameRing::CellNumber FrameRing::forEachPart(FrameNumber frame, OnPart onPart) const {
+  std::size_t rest = headOf(frame).bytes;
+  std::size_t used = sizeof(FrameHead);
+  CellNumber number = frame;
+  for (;;) {
+    const std::size_t part = std::min(rest, kCellBytes - used);
+    onPart(cell(number) + used, part);
+    rest -= part;
+    if (rest == 0) return number;
+    number = next(number).load(std::memory_order_relaxed);
+    used = 0;
+  }
+}
+
+void FrameRing::copy(FrameNumber frame, char* to) const {
+  forEachPart(frame, [&to](const char* from, std::size_t size) {
+    std::memcpy(to, from, size);
+    to += size;
+  });
+}
+
+void FrameRing::drop(FrameNumber frame) {
+  const CellNumber last = forEachPart(frame, [](const char*, std::size_t) {});
+  if (dropped_.first == kNoCell) {
+    dropped_.first = frame;
+  } else {
+    next(dropped_.last).store(frame, std::memory_order_relaxed);
+  }
+  dropped_.last = last;
+  ++droppedCount_;
 }
 
 void FrameRing::release() {
-  if (taken_.first == kNoCell) return;
-  pushCells(taken_);
-  taken_ = {};
-  released_.store(head_, std::memory_order_release);
+  if (dropped_.first == kNoCell) return;
+  pushCells(dropped_);
+  dropped_ = {};
+  released_.store(droppedCount_, std::memory_order_release);
   touchAhead();
 }
 

@@ -16,7 +16,7 @@ namespace halvox::client {
 //
 //                   pop                  publish                 isReady, take
 //   free cells ─────────────► a frame ──────────────► newest first ─────────────► the consumer
-//       ▲                                                                             │
+//       ▲                                                                             │ drop()
 //       └───────────────────────────── release(), many at once ───────────────────────┘
 //
 // The memory of the ring is divided into cells of 512 bytes. A frame takes as many cells as it
@@ -34,6 +34,9 @@ namespace halvox::client {
 // frames were tried. They took one more atomic exchange for each message.
 class FrameRing {
  public:
+  // Names a frame that the consumer has taken and not dropped.
+  using FrameNumber = std::uint32_t;
+
   // Throws std::bad_alloc.
   FrameRing(std::size_t maxFrames, std::size_t maxBytes);
   FrameRing(const FrameRing&) = delete;
@@ -47,16 +50,19 @@ class FrameRing {
   [[nodiscard]] std::uint64_t tail() const;
 
   // Only the consumer may call the following functions.
-  // Returns the position of the oldest frame in the ring.
+  // Returns the position of the oldest frame that was not taken.
   [[nodiscard]] std::uint64_t head() const { return head_; }
   // Returns true if there is a frame.
   [[nodiscard]] bool isReady() { return oldest_ != kNoCell || takeList(); }
-  // Returns the size of the oldest frame. Call this function and take() only after isReady() has
-  // returned true.
-  [[nodiscard]] std::size_t frontBytes() const { return headOf(oldest_).bytes; }
-  // Copies the oldest frame to `to` unless that is null, and removes the frame.
-  void take(char* to);
-  // Returns the cells of removed frames to the free cells.
+  // Takes the oldest frame. Call this function only after isReady() has returned true. The frame
+  // keeps its cells until drop(), because the consumer may have to send it again.
+  [[nodiscard]] FrameNumber take();
+  [[nodiscard]] std::size_t bytesOf(FrameNumber frame) const { return headOf(frame).bytes; }
+  // Copies the bytes of a frame to `to`.
+  void copy(FrameNumber frame, char* to) const;
+  // Drops a frame, in any order. It counts against the bounds until release().
+  void drop(FrameNumber frame);
+  // Returns the cells of dropped frames to the free cells.
   void release();
 
  private:
@@ -91,6 +97,9 @@ class FrameRing {
   [[nodiscard]] FrameHead headOf(CellNumber number) const;
   void setHead(CellNumber number, const FrameHead& head) const;
   [[nodiscard]] std::atomic<CellNumber>& next(CellNumber number) const { return next_[number]; }
+  // Calls `onPart` with each part of a frame's bytes. Returns the frame's last cell.
+  template <typename OnPart>
+  CellNumber forEachPart(FrameNumber frame, OnPart onPart) const;
   CellNumber popCell();
   void pushCells(const Chain& chain);
   [[nodiscard]] bool isFull(std::uint64_t newest) const;
@@ -115,11 +124,12 @@ class FrameRing {
   // Sequentially consistent with the consumer's announcement that it goes to sleep: either the
   // producer sees the announcement, or the consumer sees the frame.
   alignas(64) std::atomic<std::uint64_t> newest_{0};
-  // All positions below this one have been released.
+  // How many frames have been released.
   alignas(64) std::atomic<std::uint64_t> released_{0};
   alignas(64) std::uint64_t head_ = 0;
   CellNumber oldest_ = kNoCell;  // the consumer's list, in the order of the frames
-  Chain taken_;
+  Chain dropped_;
+  std::uint64_t droppedCount_ = 0;
   std::size_t touched_ = 0;  // bytes from the start of the memory; 0: only what map() touches
 };
 

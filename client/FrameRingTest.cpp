@@ -27,9 +27,11 @@ bool pushNumber(FrameRing& ring, std::int64_t number, ReporterID id = 7) {
 // Returns the arguments of the oldest frame, as the service decodes them.
 std::vector<Value> takeArguments(FrameRing& ring) {
   if (!ring.isReady()) return {};
-  std::string frame(kMessageHeaderBytes + ring.frontBytes(), '\0');
-  putMessageHeader(frame.data(), ring.frontBytes());
-  ring.take(frame.data() + kMessageHeaderBytes);
+  const FrameRing::FrameNumber taken = ring.take();
+  std::string frame(kMessageHeaderBytes + ring.bytesOf(taken), '\0');
+  putMessageHeader(frame.data(), ring.bytesOf(taken));
+  ring.copy(taken, frame.data() + kMessageHeaderBytes);
+  ring.drop(taken);
   setSerial(frame.data(), 1);
   const auto read = dbus::readFrame(std::as_bytes(std::span(frame)));
   std::vector<Value> arguments;
@@ -128,16 +130,40 @@ TEST(FrameRingTest, FramesOfManySizesComeOutAsTheyWere) {
   }
 }
 
-TEST(FrameRingTest, FramesTakenNowhereAreGone) {
+TEST(FrameRingTest, FramesDroppedWithoutACopyAreGone) {
   FrameRing ring(2, 4096);
   ASSERT_TRUE(pushNumber(ring, 1));
   ASSERT_TRUE(pushNumber(ring, 2));
 
   ASSERT_TRUE(ring.isReady());
-  ring.take(nullptr);
+  ring.drop(ring.take());
   ring.release();
 
   EXPECT_EQ(takeNumber(ring), 2);
+}
+
+TEST(FrameRingTest, ATakenFrameKeepsItsBytesAndItsPlaceUntilItIsDropped) {
+  const auto text = [](char filling) { return Dictionary{{"text", std::string(700, filling)}}; };
+  FrameRing ring(3, kPlentyOfBytes);
+  for (const char filling : {'a', 'b', 'c'})
+    ASSERT_EQ(push(ring, text(filling)), EncodeOutcome::kDone);
+  ASSERT_TRUE(ring.isReady());
+  const FrameRing::FrameNumber first = ring.take();
+  const FrameRing::FrameNumber second = ring.take();
+  std::string bytes(ring.bytesOf(first), '\0');
+  ring.copy(first, bytes.data());
+
+  ring.release();
+  EXPECT_EQ(push(ring, text('d')), EncodeOutcome::kNoRoom);  // no frame was dropped
+  ring.drop(second);
+  ring.release();
+  EXPECT_EQ(push(ring, text('d')), EncodeOutcome::kDone);  // uses the cells of the second frame
+
+  std::string again(bytes.size(), '\0');
+  ring.copy(first, again.data());
+  EXPECT_EQ(again, bytes);
+  EXPECT_NE(bytes.find(std::string(700, 'a')), std::string::npos);
+  EXPECT_EQ(ring.tail(), 4U);
 }
 
 // The consumer takes all frames as one list. Frames that are published after that come after this

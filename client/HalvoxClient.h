@@ -94,9 +94,10 @@ struct Options {
 struct Counters {
   std::uint64_t accepted = 0;  ///< send() returned true
   std::uint64_t dropped = 0;   ///< send() returned false: a bound is reached, or the client ends
-  std::uint64_t acknowledged = 0;  ///< answered by the service without an error
-  std::uint64_t refused = 0;       ///< answered with an error, or not representable on the wire
-  /// Sent but not answered when a connection ended. The client does not send these messages again,
+  /// Answered by the service without an error, or taken by it when it ended in an orderly way.
+  std::uint64_t acknowledged = 0;
+  std::uint64_t refused = 0;  ///< answered with an error, or not representable on the wire
+  /// Sent but not answered when the service crashed. The client does not send these messages again,
   /// because the service may have received them. Also counts the messages that were discarded
   /// because 8,192 session operations were waiting without a service.
   std::uint64_t lost = 0;
@@ -112,6 +113,10 @@ struct Counters {
 /// answered. If the service ends, the client waits for a new service and connects to it. It then
 /// creates its sessions again with their types and configurations, and starts those that were
 /// running. Until then messages wait, up to the bounds.
+///
+/// When a service ends in an orderly way, as in a restart, it tells its clients which of their
+/// requests it has taken. The client sends the others to the next service, and every message
+/// arrives exactly once. When a service crashes, the messages that it has not answered are lost.
 ///
 /// Any thread may call these functions. send() encodes the message on the caller's thread, and
 /// keeps no reference to it. An audio thread may call send(), because it never blocks, takes no

@@ -14,12 +14,13 @@ namespace halvox::client {
 
 // The time limit of the tests. It is long enough for a slow machine.
 inline constexpr std::chrono::seconds kPatience{20};
-inline constexpr Category kPlayback = 4;
-inline constexpr EventType kStart = 1;
 
 // A fixture with a test service in a scratch directory.
 class HalvoxClientFixture : public testing::Test {
  protected:
+  static constexpr Category kPlayback = 4;
+  static constexpr EventType kStart = 1;
+
   HalvoxClientFixture() : socketPath_(scratch_.path("reporting.sock")), service_(socketPath_) {}
 
   [[nodiscard]] Options options() const {

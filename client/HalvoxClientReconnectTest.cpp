@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
+#include <numeric>
 #include <string>
 #include <thread>
 #include <vector>
@@ -105,6 +106,110 @@ TEST_F(HalvoxClientReconnectTest, MessagesInFlightAtALossAreLostAndNotSentAgain)
   ASSERT_EQ(numbers.size(), counters.acknowledged);
   EXPECT_EQ(numbers.front(), static_cast<std::int64_t>(counters.lost));
   EXPECT_TRUE(std::is_sorted(numbers.begin(), numbers.end()));
+}
+
+TEST_F(HalvoxClientReconnectTest, WhatAServiceHadNotTakenAtItsEndArrivesAtTheNextOneOnce) {
+  HalvoxClient client(options());
+  ASSERT_TRUE(client.flush(kPatience));
+  service_.setStalled(true);
+  for (int number = 0; number < 1000; ++number) {
+    ASSERT_TRUE(
+        client.send(7, {{"n", number}, {"text", std::string(700, 'x')}}, kPlayback, kStart));
+  }
+  EXPECT_FALSE(client.flush(50ms));  // by now the window is full
+
+  service_.end();
+  service_.setStalled(false);
+  service_.come();
+  ASSERT_TRUE(client.flush(kPatience));
+
+  std::vector<std::int64_t> all(1000);
+  std::iota(all.begin(), all.end(), 0);
+  EXPECT_EQ(numbersReceived(), all);
+  EXPECT_EQ(client.counters().acknowledged, 1000U);
+  EXPECT_EQ(client.counters().lost, 0U);
+}
+
+TEST_F(HalvoxClientReconnectTest, MessagesThatAServiceTookBeforeItsEndAreNotSentAgain) {
+  HalvoxClient client(options());
+  ASSERT_TRUE(client.flush(kPatience));
+  service_.setSilent(true);
+  for (int number = 0; number < 3; ++number) client.send(7, {{"n", number}}, kPlayback, kStart);
+  ASSERT_TRUE(service_.waitForCalls("sendMessage", 3));
+  service_.setStalled(true);
+  client.send(7, {{"n", 3}}, kPlayback, kStart);
+  EXPECT_FALSE(client.flush(50ms));
+
+  service_.end();
+  service_.setStalled(false);
+  service_.setSilent(false);
+  service_.come();
+  ASSERT_TRUE(client.flush(kPatience));
+
+  EXPECT_EQ(numbersReceived(), (std::vector<std::int64_t>{0, 1, 2, 3}));
+  EXPECT_EQ(client.counters().acknowledged, 4U);
+  expectBalance(client.counters());
+}
+
+TEST_F(HalvoxClientReconnectTest, SessionStepsThatAServiceHadNotTakenAtItsEndKeepTheirOrder) {
+  HalvoxClient client(options());
+  client.createSession(7);
+  client.setConfiguration(7, {{"a", 1}});
+  client.start(7);
+  ASSERT_TRUE(client.flush(kPatience));
+  const std::size_t before = service_.calls().size();
+  service_.setStalled(true);
+  client.send(7, {{"n", 1}}, kPlayback, kStart);
+  client.stop(7);
+  client.send(7, {{"n", 2}}, kPlayback, kStart);
+  client.destroySession(7);
+  client.createSession(8);
+  EXPECT_FALSE(client.flush(50ms));
+
+  service_.end();
+  service_.setStalled(false);
+  service_.come();
+  ASSERT_TRUE(client.flush(kPatience));
+
+  std::string members;
+  const auto calls = service_.calls();
+  for (std::size_t index = before; index < calls.size(); ++index)
+    members += calls[index].member + " ";
+  EXPECT_EQ(members,
+            "createReportingSession setConfiguration startReportingSessionForID sendMessage "
+            "stopReportingSessionForID sendMessage destroyReportingSession createReportingSession "
+            "reporterIDValid reporterIDValid ");  // of both flushes
+  EXPECT_EQ(client.counters().lost, 0U);
+}
+
+TEST_F(HalvoxClientReconnectTest, NothingIsLostOrDoubledOverOrderlyEndsUnderLoad) {
+  HalvoxClient client(options());
+  client.createSession(7);
+  client.start(7);
+  std::atomic<bool> done{false};
+  std::int64_t sent = 0;
+  std::jthread sender([&] {
+    while (!done) {
+      if (client.send(7, {{"n", sent}}, kPlayback, kStart)) ++sent;
+      while (!done && client.counters().pending > 300) std::this_thread::yield();
+    }
+  });
+
+  for (int round = 0; round < 5; ++round) {
+    const std::size_t before = service_.count("sendMessage");
+    ASSERT_TRUE(service_.waitForCalls("sendMessage", before + 100));
+    service_.end();
+    service_.come();
+  }
+  done = true;
+  sender.join();
+  ASSERT_TRUE(client.flush(kPatience));
+
+  std::vector<std::int64_t> all(static_cast<std::size_t>(sent));
+  std::iota(all.begin(), all.end(), 0);
+  EXPECT_EQ(numbersReceived(), all);
+  EXPECT_EQ(client.counters().lost, 0U);
+  EXPECT_EQ(client.counters().acknowledged, static_cast<std::uint64_t>(sent));
 }
 
 TEST_F(HalvoxClientReconnectTest, TellsItsHandlerOfEveryConnectionMadeAndLost) {

@@ -274,7 +274,7 @@ TEST(RingMemoryTest, TheConsumerTouchesMemoryBeforeTheProducersNeedIt) {
   const halvox::client::EncodedMessageView view{std::nullopt, message, 4, 18};
   for (int number = 0; number < kMessages; ++number) ring.tryPush(view);
   ASSERT_TRUE(ring.isReady());
-  ring.take(nullptr);
+  ring.drop(ring.take());
   ring.release();
 
   const std::int64_t before = pageFaults();

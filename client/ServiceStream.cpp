@@ -9,6 +9,7 @@
 #include <sys/socket.h>
 #include <sys/un.h>
 
+#include "platform/linux/connection/wire/EndedSignal.h"
 #include "platform/linux/connection/wire/HeaderFields.h"
 
 namespace halvox::client {
@@ -105,6 +106,15 @@ bool ServiceStream::send() {
 }
 
 bool ServiceStream::receive() {
+  readInput();
+  if (!ready_) continueHandshake();
+  return isOpen();
+}
+
+bool ServiceStream::receiveRest() { return fd_ && readInput(); }
+
+// Returns true if bytes have come.
+bool ServiceStream::readInput() {
   if (consumed_ == filled_) {
     consumed_ = filled_ = 0;
   } else if (consumed_ > 0) {
@@ -115,8 +125,7 @@ bool ServiceStream::receive() {
   const ssize_t size = recv(fd_.get(), input_.data() + filled_, input_.size() - filled_, 0);
   if (size > 0) filled_ += static_cast<std::size_t>(size);
   if (size == 0 || (size < 0 && !isTransient(errno))) ended_ = true;
-  if (!ready_) continueHandshake();
-  return isOpen();
+  return size > 0;
 }
 
 // The service first asks for the identity with the line "DATA", and then agrees with "OK". The
@@ -173,6 +182,10 @@ NextFrame nextFrame(std::span<const std::byte> input) {
   const bool isAnswer = isError || header.type == dbus::MessageType::kMethodReturn;
   next.state = isAnswer ? NextFrame::State::kAnswer : NextFrame::State::kOther;
   next.answer = {header.replySerial, isError, bytes};
+  if (const auto lastRequest = dbus::readEndedSignal(std::get<dbus::Frame>(frame))) {
+    next.state = NextFrame::State::kEnded;
+    next.lastRequest = *lastRequest;
+  }
   return next;
 }
 

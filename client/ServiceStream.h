@@ -50,6 +50,8 @@ class ServiceStream {
   void append(std::string_view frame) { frame.copy(append(frame.size()), frame.size()); }
   bool send();
   bool receive();
+  // Reads bytes that the service sent before the connection ended. Returns false if there are none.
+  bool receiveRest();
   // Ends the connection from this side, without closing the socket yet.
   void end() { ended_ = true; }
 
@@ -59,6 +61,7 @@ class ServiceStream {
   void consume(std::size_t bytes) { consumed_ += bytes; }
 
  private:
+  bool readInput();
   void continueHandshake();
 
   platform::linux_::UniqueFd fd_;
@@ -96,12 +99,14 @@ struct NextFrame {
   enum class State : std::uint8_t {
     kIncomplete,  // wait for more bytes
     kAnswer,      // `answer` names the call
+    kEnded,       // the service ends; `lastRequest` is the last one that it has taken
     kOther,       // a frame that answers nothing: ignore it
     kBroken,      // not D-Bus: the connection cannot be used any more
   };
   State state = State::kIncomplete;
   std::size_t bytes = 0;  // bytes to consume
   Answer answer;
+  std::uint32_t lastRequest = 0;
 };
 
 // Looks at the first frame of `input`. Recognises the usual answers of the service by their first

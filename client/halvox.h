@@ -258,11 +258,11 @@ typedef struct halvox_counters {
   size_t size;           /**< set it to sizeof(halvox_counters) before the call */
   uint64_t accepted;     /**< a send function returned HALVOX_OK */
   uint64_t dropped;      /**< a send function returned HALVOX_DROPPED */
-  uint64_t acknowledged; /**< answered by the service without an error */
+  uint64_t acknowledged; /**< answered by the service without an error, or taken by it at its end */
   uint64_t refused;      /**< answered with an error, or not representable on the wire */
-  uint64_t lost;         /**< sent but not answered when a connection ended; the service may have
-                            received them. Also messages that were discarded because 8,192 session
-                            operations were waiting without a service */
+  uint64_t lost;         /**< sent but not answered when the service crashed; it may have received
+                            them. Also messages that were discarded because 8,192 session operations
+                            were waiting without a service */
   uint64_t pending;      /**< waiting or in flight */
   uint64_t reconnects;   /**< connections made after the first one */
 } halvox_counters;

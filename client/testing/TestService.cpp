@@ -50,6 +50,21 @@ void TestService::vanish() {
   perform([this] { leave(); });
 }
 
+void TestService::end() {
+  perform([this] {
+    for (const auto& connection : connections_) {
+      sd_bus_emit_signal(connection.bus.get(), "/com/tarno/halvox/reporting",
+                         "com.tarno.halvox.Connection", "Ended", "u", connection.lastRequest);
+      sd_bus_flush(connection.bus.get());
+    }
+    leave();
+  });
+}
+
+void TestService::setSilent(bool silent) {
+  perform([this, silent] { silent_ = silent; });
+}
+
 void TestService::come() {
   perform([this] { listen(); });
 }
@@ -68,17 +83,21 @@ std::vector<RecordedCall> TestService::calls() {
 
 std::size_t TestService::count(std::string_view member) {
   const MutexLock lock(mutex_);
-  return static_cast<std::size_t>(std::ranges::count(calls_, member, &RecordedCall::member));
+  return countLocked(member);
 }
 
 bool TestService::waitForCalls(std::string_view member, std::size_t count) {
   const auto deadline = std::chrono::steady_clock::now() + platform::linux_::kTestDeadline;
   const MutexLock lock(mutex_);
-  while (static_cast<std::size_t>(std::ranges::count(calls_, member, &RecordedCall::member)) <
-         count) {
+  while (countLocked(member) < count) {
     if (!changed_.waitUntil(mutex_, deadline)) return false;
   }
   return true;
+}
+
+std::size_t TestService::countLocked(std::string_view member) const {
+  const auto found = counts_.find(member);
+  return found != counts_.end() ? found->second : 0;
 }
 
 std::string TestService::members() {
@@ -187,8 +206,13 @@ int TestService::answer(Connection& connection, sd_bus_message* message) {
   {
     const MutexLock lock(mutex_);
     calls_.push_back(call);
+    ++counts_[call.member];
     changed_.notifyAll();
   }
+  std::uint64_t serial = 0;
+  sd_bus_message_get_cookie(message, &serial);
+  connection.lastRequest = static_cast<std::uint32_t>(serial);
+  if (silent_) return 0;
   if (call.member == refusedMember_) {
     return sd_bus_reply_method_errorf(message, errorName_.c_str(), "refused by the test");
   }

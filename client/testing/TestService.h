@@ -39,8 +39,14 @@ class TestService {
 
   // A stalled service keeps its connections, but reads nothing from them and accepts no new ones.
   void setStalled(bool stalled);
-  // Ends every connection and removes the socket; come() listens again.
+  // Ends every connection without a word, as a crash does, and removes the socket; come() listens
+  // again.
   void vanish();
+  // Does the same in an orderly way: tells each client which of its requests was the last one
+  // taken.
+  void end();
+  // Makes the service take requests without answering them.
+  void setSilent(bool silent);
   void come();
   // Answers all later requests of that member with an error. An empty error name makes it answer
   // them normally again.
@@ -67,9 +73,11 @@ class TestService {
     TestService* service = nullptr;
     BusHandle bus;
     std::map<ReporterID, Session> sessions;
+    std::uint32_t lastRequest = 0;
   };
 
   void run();
+  [[nodiscard]] std::size_t countLocked(std::string_view member) const HALVOX_REQUIRES(mutex_);
   void perform(Job job);  // runs it on the service's thread and waits for its end
   void listen();
   void leave();
@@ -87,10 +95,12 @@ class TestService {
   platform::linux_::Mutex mutex_;
   platform::linux_::Condition changed_;
   std::vector<RecordedCall> calls_ HALVOX_GUARDED_BY(mutex_);
+  std::map<std::string, std::size_t, std::less<>> counts_ HALVOX_GUARDED_BY(mutex_);  // by member
   std::list<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
   std::size_t jobsDone_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::size_t jobsAsked_ HALVOX_GUARDED_BY(mutex_) = 0;
   // Used only by the service's thread.
+  bool silent_ = false;
   bool stalled_ = false;
   bool leaving_ = false;
   bool ended_ = false;
