@@ -8,6 +8,7 @@
 
 #include "backends/HVReportingTallyhubBridge.h"
 #include "backends/HVReportingVocabulary.h"
+#include "backends/PrivacyFilter.h"
 #include "driver/DriverLog.h"
 #include "platform/services.h"
 #include "session/HVReportingSession.h"
@@ -79,6 +80,7 @@ void addStream(HVReportingDriverUtility::DriverStats& stats, const HVReportingSe
 
 void send(HVReportingDriverUtility::DriverStats& stats, AudioEventType type,
           const std::shared_ptr<HVReportingSession>& session) {
+  applyPrivacy(stats);
   // Tested before the stream is added, because a stream without statistics is not worth a message.
   if (stats.empty()) return;
   addStream(stats, *session);

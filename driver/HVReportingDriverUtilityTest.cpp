@@ -173,6 +173,20 @@ TEST_F(HVReportingDriverUtilityTest, AChannelThatIsNotInTheSnapshotIsNotSent) {
             (Dictionary{{"Amp_Speaker_Simple_a", 4}, {"audiotag", "IOReportingSimple"}}));
 }
 
+TEST_F(HVReportingDriverUtilityTest, ADroppedCounterIsNotSent) {
+  platform_.privacy.drop("Amp_Speaker_Simple_b");
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1), simpleChannel("b", 1)});
+  const auto utility = makeUtility();
+  session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 5), simpleChannel("b", 5)});
+
+  utility.sendDriverLogsForSession(session_);
+
+  ASSERT_EQ(recorded().size(), 1U);
+  EXPECT_EQ(recorded()[0],
+            (Dictionary{{"Amp_Speaker_Simple_a", 4}, {"audiotag", "IOReportingSimple"}}));
+}
+
 // The groups are sampled one after the other, and a driver may count in between.
 TEST_F(HVReportingDriverUtilityTest, AllGroupsOfASnapshotAreOfOneMoment) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});

@@ -45,6 +45,7 @@ OverflowService& overflow() { return installed().overflow; }
 PerformanceTraceService& performanceTraces() { return installed().performanceTraces; }
 PowerLogService& powerLog() { return installed().powerLog; }
 PreferenceService& preferences() { return installed().preferences; }
+PrivacyService& privacy() { return installed().privacy; }
 ProcessService& process() { return installed().process; }
 PropertyListService& propertyLists() { return installed().propertyLists; }
 ResultsFileService& resultsFiles() { return installed().resultsFiles; }

@@ -5,6 +5,7 @@
 
 #include "backends/HVReportingUtility.h"
 #include "backends/HVReportingUtilityVEKStateManager.h"
+#include "backends/PrivacyFilter.h"
 #include "platform/services.h"
 #include "service/ReportingQueue.h"
 #include "service/ServiceLog.h"
@@ -152,6 +153,7 @@ void HVReportingClientServerInstance::getServiceNameForReporterID(ReporterID rep
 void HVReportingClientServerInstance::setConfiguration(platform::Dictionary configuration,
                                                        ReporterID reporterID, BoolReply reply,
                                                        RequestContext context) {
+  applyPrivacy(configuration);
   ResourceCharge charge(account_, configuration.memorySize());
   queueRequest(platform::JobWeight::kBrief, std::move(context),
                [configuration = std::move(configuration), reporterID, reply = std::move(reply),
@@ -198,6 +200,7 @@ void HVReportingClientServerInstance::postMessage(platform::Message message,
       spares->pop_back();
     }
   }
+  applyPrivacy(message);
   ResourceCharge charge(account_, message ? message->memorySize() : 0);
   // The sender's name is looked up here, on the connection's thread, because the sender may have
   // ended by the time the job runs.

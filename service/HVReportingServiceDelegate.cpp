@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "backends/HVReportingUtility.h"
+#include "backends/PrivacyFilter.h"
 #include "platform/analytics.h"
 #include "platform/clock.h"
 #include "platform/services.h"
@@ -49,7 +50,9 @@ platform::Value clientUptime(const std::optional<platform::Date>& start, platfor
 
 void sendUptimeEvent(const std::string& processName, const platform::Value& uptime) {
   platform::analytics().sendAnalyticsEventLazy(kUptimeEvent, [processName, uptime] {
-    return platform::Dictionary{{"processName", processName}, {"seconds", uptime}};
+    platform::Dictionary event{{"processName", processName}, {"seconds", uptime}};
+    applyPrivacy(event);
+    return event;
   });
 }
 

@@ -1,6 +1,7 @@
 #include <string>
 #include <utility>
 
+#include "backends/PrivacyFilter.h"
 #include "platform/clock.h"
 #include "platform/notify.h"
 #include "platform/preferences.h"
@@ -62,6 +63,7 @@ Dictionary HVReportingServiceDelegate::HVReportingDefaults() {
   } else {
     defaults.set(kDisableReportingKey, 0);
   }
+  applyPrivacy(defaults);
   return defaults;
 }
 
@@ -84,6 +86,7 @@ platform::Message HVReportingServiceDelegate::getFeaturesState() const {
     auto value = platform::preferences().CFPreferencesCopyValue(feature, domain, kUserName);
     if (value.has_value()) state.set(feature, *std::move(value));
   }
+  applyPrivacy(state);
   // Tested before the time stamps are added, because they are not settings.
   if (state.empty()) return std::nullopt;
   stamp(state);

@@ -2,6 +2,7 @@
 #include <memory>
 #include <utility>
 
+#include "backends/PrivacyFilter.h"
 #include "platform/diagnostic_reporter.h"
 #include "platform/services.h"
 #include "service/HVReportingClientServerInstance.h"
@@ -31,6 +32,7 @@ platform::Dictionary describeClient(const HVReportingClientServerInstance& clien
   }
   state.set("session_count", static_cast<std::uint64_t>(sessions.size()));
   state.set("sessions", platform::Array(described));
+  applyPrivacy(state);
   return state;
 }
 

@@ -18,6 +18,7 @@
 #include "platform/fake/FakePerformanceTraceService.h"
 #include "platform/fake/FakePowerLogService.h"
 #include "platform/fake/FakePreferenceService.h"
+#include "platform/fake/FakePrivacyService.h"
 #include "platform/fake/FakeProcessService.h"
 #include "platform/fake/FakePropertyListService.h"
 #include "platform/fake/FakeResultsFileService.h"
@@ -57,6 +58,7 @@ struct FakePlatform {
   FakeOverflowService overflow;
   FakePowerLogService powerLog{journal};
   FakePreferenceService preferences;
+  FakePrivacyService privacy;
   FakeIOReportService ioReport{journal};
   FakeKtraceService ktrace{journal};
   FakePerformanceTraceService performanceTraces{journal, dispatch};

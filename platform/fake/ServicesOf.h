@@ -27,6 +27,7 @@ template <typename Platform>
           .performanceTraces = platform.performanceTraces,
           .powerLog = platform.powerLog,
           .preferences = platform.preferences,
+          .privacy = platform.privacy,
           .process = platform.process,
           .propertyLists = platform.propertyLists,
           .resultsFiles = platform.resultsFiles,

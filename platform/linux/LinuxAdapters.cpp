@@ -144,6 +144,7 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
       // Write the queued lines of the log, because the last one says why the process ends.
       process([this] { log->stop(); }),
       deviceProperties(configuration.device),
+      privacy(configuration.privacy),
       store(storeOptions(configuration), {clock, statistics, backpressure}),
       analytics(store, clock),
       diagnosticReporters(snapshotOptions(configuration),

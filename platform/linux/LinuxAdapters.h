@@ -9,6 +9,7 @@
 #include "platform/linux/configuration/Configuration.h"
 #include "platform/linux/configuration/ConfiguredDevicePropertyService.h"
 #include "platform/linux/configuration/ConfiguredFeatureFlagService.h"
+#include "platform/linux/configuration/ConfiguredPrivacyService.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
 #include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
 #include "platform/linux/dispatch/AsioDispatchService.h"
@@ -70,6 +71,7 @@ struct LinuxAdapters {
   LibcClockService clock;
   ProcfsProcessService process;
   ConfiguredDevicePropertyService deviceProperties;
+  ConfiguredPrivacyService privacy;
   SqliteStore store;
   SqliteAnalyticsService analytics;
   SqliteSnapshotRecorder snapshotRecorder{store};

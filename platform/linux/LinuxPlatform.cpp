@@ -79,6 +79,7 @@ Services LinuxPlatform::services() {
           .performanceTraces = adapters_->traces->performanceTraces(),
           .powerLog = adapters_->powerLog,
           .preferences = adapters_->preferences,
+          .privacy = adapters_->privacy,
           .process = adapters_->process,
           .propertyLists = adapters_->propertyLists,
           .resultsFiles = adapters_->resultsFiles,

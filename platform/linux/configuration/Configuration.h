@@ -74,12 +74,17 @@ struct Configuration {
     std::uint64_t messageReporterIDs = defaults::kMessageReporterIDs;  // message_reporter_ids
   };
 
+  struct Privacy {
+    std::vector<std::string> dropKeys;  // drop_keys: glob patterns
+  };
+
   Listener listener;
   Storage storage;
   Analytics analytics;
   Link link;
   Limits limits;
   Drivers drivers;
+  Privacy privacy;
   std::filesystem::path preferencesDirectory;  // [preferences]: <directory>/<user>/<domain>.toml
   std::filesystem::path notifyDirectory;       // [notify]: each file stands for a notification
   LogLevel logLevel = LogLevel::kDefault;

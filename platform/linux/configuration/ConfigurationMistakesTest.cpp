@@ -62,6 +62,21 @@ INSTANTIATE_TEST_SUITE_P(
         MistakeCase{"NoSeconds", "[listener]\nhandshake_seconds = 0",
                     "2:21: listener.handshake_seconds: expected a number of seconds from 0.001 "
                     "to 86400, found 0"},
+        MistakeCase{"NoPatterns", "[privacy]\ndrop_keys = []",
+                    "2:13: privacy.drop_keys: expected an array of patterns of keys such as "
+                    "\"user_*\", found an array"},
+        MistakeCase{"EmptyPattern", "[privacy]\ndrop_keys = [\"a\", \"\"]",
+                    "2:19: privacy.drop_keys: expected an array of patterns of keys such as "
+                    "\"user_*\", found the string \"\""},
+        MistakeCase{"ListWithoutEnd", "[privacy]\ndrop_keys = [\"a[bc\"]",
+                    "2:14: privacy.drop_keys: expected an array of patterns of keys such as "
+                    "\"user_*\", found the string \"a[bc\""},
+        MistakeCase{"ListWithOnlyABracket", "[privacy]\ndrop_keys = [\"a[]\"]",
+                    "2:14: privacy.drop_keys: expected an array of patterns of keys such as "
+                    "\"user_*\", found the string \"a[]\""},
+        MistakeCase{"MisspeltRule", "[privacy]\ndrop_key = [\"a\"]",
+                    "2:1: privacy.drop_key: expected a known key, found an unknown one; the "
+                    "closest is \"drop_keys\""},
         MistakeCase{"UnknownChoice", "[log]\nlevel = \"verbose\"",
                     "2:9: log.level: expected \"debug\" or \"info\" or \"default\" or \"error\", "
                     "found the string \"verbose\""},

@@ -34,6 +34,16 @@ TEST_F(ConfigurationTest, LevelsOfTheLogAndOfItsMemoryAreIndependent) {
   EXPECT_EQ(kept.logMemoryLevel, LogLevel::kDebug);
 }
 
+TEST_F(ConfigurationTest, PatternsOfDroppedKeysMayHaveListsOfCharacters) {
+  const Configuration configuration =
+      loaded("[privacy]\ndrop_keys = ['user_*', 'a[]x]', 'b[!]]', 'c[[]', '[a-z]?']");
+
+  EXPECT_EQ(configuration.privacy.dropKeys,
+            (std::vector<std::string>{"user_*", "a[]x]", "b[!]]", "c[[]", "[a-z]?"}));
+  EXPECT_TRUE(loaded("").privacy.dropKeys.empty());
+  EXPECT_TRUE(loaded("[privacy]").privacy.dropKeys.empty());
+}
+
 TEST_F(ConfigurationTest, EnvironmentGivesTheDefaultDirectories) {
   ::setenv("XDG_RUNTIME_DIR", "/run/user/7", 1);
   ::setenv("XDG_STATE_HOME", "/var/state", 1);

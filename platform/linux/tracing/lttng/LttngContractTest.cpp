@@ -103,6 +103,7 @@ class LttngHarness {
                      .performanceTraces = performanceTraces_,
                      .powerLog = fakes_.powerLog,
                      .preferences = fakes_.preferences,
+                     .privacy = fakes_.privacy,
                      .process = fakes_.process,
                      .propertyLists = fakes_.propertyLists,
                      .resultsFiles = fakes_.resultsFiles,
