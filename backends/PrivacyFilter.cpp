@@ -2,7 +2,6 @@
 
 #include <vector>
 
-#include "platform/privacy.h"
 #include "platform/services.h"
 
 namespace halvox {
@@ -41,13 +40,11 @@ Value filtered(const PrivacyService& rules, const Value& value) {
 
 }  // namespace
 
-void applyPrivacy(Dictionary& dictionary) {
+void dropKeys(Dictionary& dictionary) {
   const PrivacyService& rules = platform::privacy();
   if (rules.hasKeyRules()) dictionary = filtered(rules, dictionary);
 }
 
-void applyPrivacy(platform::Message& message) {
-  if (message.has_value()) applyPrivacy(*message);
-}
+bool isKeyDropped(std::string_view key) { return platform::privacy().dropsKey(key); }
 
 }  // namespace halvox

@@ -1,5 +1,7 @@
 #include "backends/PrivacyFilter.h"
 
+#include <memory>
+
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
@@ -23,6 +25,34 @@ TEST_F(PrivacyFilterTest, WithoutRulesTheDictionaryStaysTheSameObject) {
   applyPrivacy(filtered);
 
   EXPECT_TRUE(filtered.isIdenticalTo(original));
+}
+
+TEST_F(PrivacyFilterTest, TheFlagFollowsTheRulesOfTheServicesThatExist) {
+  using platform::FakePrivacyService;
+  using platform::PrivacyService;
+  EXPECT_FALSE(PrivacyService::anyKeyRules());
+
+  auto other = std::make_unique<FakePrivacyService>();
+  EXPECT_FALSE(PrivacyService::anyKeyRules());
+  other->drop("user");
+  EXPECT_TRUE(PrivacyService::anyKeyRules());
+  platform_.privacy.drop("user");
+  platform_.privacy.drop("name");
+  other.reset();
+  EXPECT_TRUE(PrivacyService::anyKeyRules());
+  EXPECT_TRUE(isDropped("user"));
+  EXPECT_FALSE(isDropped("other"));
+}
+
+TEST_F(PrivacyFilterTest, RulesOfAServiceThatIsNotInstalledDropNothing) {
+  platform::FakePrivacyService other;
+  other.drop("user");
+  Dictionary dictionary{{"user", "Ada"}};
+
+  applyPrivacy(dictionary);
+
+  EXPECT_TRUE(dictionary.contains("user"));
+  EXPECT_FALSE(isDropped("user"));
 }
 
 TEST_F(PrivacyFilterTest, DroppedKeysAreMissingAndTheOthersKeepTheirOrder) {

@@ -20,6 +20,7 @@
 #include "platform/linux/files/FileOverflowService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/log.h"
+#include "platform/privacy.h"
 #include "platform/process.h"
 #include "platform/services.h"
 #include "platform/statistics.h"
@@ -162,6 +163,12 @@ class NullLog final : public platform::LogService {
   NullLogCategory category_;
 };
 
+class NullPrivacy final : public platform::PrivacyService {
+ public:
+  NullPrivacy() : PrivacyService(KeyRules::kNone) {}
+  [[nodiscard]] bool dropsKey(std::string_view /*key*/) const override { return false; }
+};
+
 class NullProcess final : public platform::ProcessService {
  public:
   std::optional<platform::ProcessRecord> processRecord(platform::ProcessID pid) const override {
@@ -199,6 +206,7 @@ struct NullPlatform {
   AbsentPropertyLists propertyLists;
   AbsentResultsFiles resultsFiles;
   NullLog log;
+  NullPrivacy privacy;
   NullProcess process;
   // Real counters, because counting is part of the cost of a message.
   platform::linux_::CounterStatisticsService statistics;

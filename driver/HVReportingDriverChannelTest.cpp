@@ -167,6 +167,13 @@ TEST_F(HVReportingDriverChannelTest, StateChannelReportsTheStatesWithResidency) 
             (std::vector<std::string>{"the current reported data is : " + text}));
 }
 
+TEST_F(HVReportingDriverChannelTest, ADroppedStateChannelIsNeitherReportedNorLogged) {
+  platform_.privacy.drop("AmpDriver_Haptics_Stats_State_PeakLevel");
+
+  EXPECT_TRUE(state({{"running", 2, 300, 0.75}}).empty());
+  EXPECT_TRUE(platform_.log.texts(platform::LogLevel::kDebug).empty());
+}
+
 TEST_F(HVReportingDriverChannelTest, StateChannelWithoutResidencyIsReportedEmpty) {
   EXPECT_EQ(state({{"running", 2, 0, 0}}).begin()->value.string(), "");
   EXPECT_EQ(state({}).size(), 1U);

@@ -264,6 +264,9 @@ void HVReportingDriverUtility::processHistogramData(const IOReportChannel& chann
 
 void HVReportingDriverUtility::processStateData(const IOReportChannel& channel,
                                                 DriverStats& driverStats) {
+  const platform::Key key(getDriverStatsKey(channel, kStateType));
+  // Tested here too, not only before the message is sent, because the value is logged below.
+  if (isDropped(key.text())) return;
   std::string text;
   const std::int32_t count = IOReportStateGetCount(channel);
   for (std::int32_t index = 0; index < count; ++index) {
@@ -277,7 +280,7 @@ void HVReportingDriverUtility::processStateData(const IOReportChannel& channel,
   }
   kDriverLog.debug("the current reported data is : ", text);
   // Reported even if the text is empty, so that the receiver sees that the channel exists.
-  driverStats.set(platform::Key(getDriverStatsKey(channel, kStateType)), text);
+  driverStats.set(key, text);
 }
 
 std::string HVReportingDriverUtility::getDriverStatsKey(const IOReportChannel& channel,

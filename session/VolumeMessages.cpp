@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "backends/HVReportingUtility.h"
+#include "backends/PrivacyFilter.h"
 
 namespace halvox {
 namespace {
@@ -88,13 +89,18 @@ std::optional<Dictionary> VolumeIntervals::add(const Dictionary& message) {
 Dictionary VolumeIntervals::makeMessage(double seconds) const {
   // The message has the volume that was playing, not the one that ended the interval. The length is
   // stored in single precision, but its bucket is chosen in double precision. Both are required.
-  return {{kFormatKey, format_},
-          {kDevicesKey, devices_},
-          {kProcessKey, process_},
-          {kVolumeKey, lastVolume_},
-          {kVolumeBucketedKey, bucketed(lastVolume_, volumeBuckets(), kVolumeFractionDigits)},
-          {kPlaySecondsKey, static_cast<float>(seconds)},
-          {kPlaySecondsBucketedKey, bucketed(seconds, secondsBuckets(), kSecondsFractionDigits)}};
+  Dictionary message{
+      {kFormatKey, format_},
+      {kDevicesKey, devices_},
+      {kProcessKey, process_},
+      {kVolumeKey, lastVolume_},
+      {kVolumeBucketedKey, bucketed(lastVolume_, volumeBuckets(), kVolumeFractionDigits)},
+      {kPlaySecondsKey, static_cast<float>(seconds)},
+      {kPlaySecondsBucketedKey, bucketed(seconds, secondsBuckets(), kSecondsFractionDigits)}};
+  // The messages that the values come from have passed the rules. These keys have not: most of them
+  // are made here.
+  applyPrivacy(message);
+  return message;
 }
 
 bool VolumeIntervals::isConcernedWith(const Dictionary& message) {

@@ -74,6 +74,19 @@ TEST_F(VolumeMessagesTest, AMessageHasSevenEntries) {
                                                   {"play_secondsBucketed", "30"}}));
 }
 
+TEST_F(VolumeMessagesTest, DroppedKeysAreNotInTheMessageThatIsMade) {
+  for (const auto* key : {"session_selected_format", "RQSessionVolumeBucketed", "play_seconds"}) {
+    platform_.privacy.drop(key);
+  }
+  playing(0.5, 10);
+  silent(0.5, 40);
+
+  EXPECT_THAT(messages(5), ElementsAre(Dictionary{{"active_devices", "Unknown"},
+                                                  {"RQSessionVolumeOperationProcess", "Unknown"},
+                                                  {"RQSessionVolume", 0.5},
+                                                  {"play_secondsBucketed", "30"}}));
+}
+
 TEST_F(VolumeMessagesTest, SecondsHaveSinglePrecision) {
   playing(0.5, 0.125);
   silent(0.5, 10.225);

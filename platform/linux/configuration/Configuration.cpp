@@ -247,23 +247,8 @@ void readDrivers(TableReader table, Configuration::Drivers& drivers) {
   table.finish();
 }
 
-// Whether fnmatch(3) can match something with the pattern. It takes a bracket without an end for an
-// ordinary character: a rule with a slip of the pen would then silently protect nothing.
-bool isPattern(std::string_view text) {
-  if (text.empty() || text.find('\0') != std::string_view::npos) return false;
-  for (std::size_t at = text.find('['); at != std::string_view::npos; at = text.find('[', at + 1)) {
-    // A "]" that is the first character of the list belongs to the list.
-    const std::string_view list = text.substr(at + 1);
-    const std::size_t negation = list.starts_with('!') || list.starts_with('^') ? 1 : 0;
-    const std::size_t end = list.find(']', negation + 1);
-    if (end == std::string_view::npos) return false;
-    at += 1 + end;
-  }
-  return true;
-}
-
 void readPrivacy(TableReader table, Configuration::Privacy& privacy) {
-  table.readTexts("drop_keys", isPattern, "patterns of keys such as \"user_*\"", privacy.dropKeys);
+  table.readPatterns("drop_keys", "patterns of keys such as \"user_*\"", privacy.dropKeys);
   table.finish();
 }
 

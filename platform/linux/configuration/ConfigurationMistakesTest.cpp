@@ -65,15 +65,18 @@ INSTANTIATE_TEST_SUITE_P(
         MistakeCase{"NoPatterns", "[privacy]\ndrop_keys = []",
                     "2:13: privacy.drop_keys: expected an array of patterns of keys such as "
                     "\"user_*\", found an array"},
-        MistakeCase{"EmptyPattern", "[privacy]\ndrop_keys = [\"a\", \"\"]",
+        MistakeCase{"PatternThatIsNoText", "[privacy]\ndrop_keys = [\"a\", 7]",
                     "2:19: privacy.drop_keys: expected an array of patterns of keys such as "
-                    "\"user_*\", found the string \"\""},
-        MistakeCase{"ListWithoutEnd", "[privacy]\ndrop_keys = [\"a[bc\"]",
-                    "2:14: privacy.drop_keys: expected an array of patterns of keys such as "
-                    "\"user_*\", found the string \"a[bc\""},
-        MistakeCase{"ListWithOnlyABracket", "[privacy]\ndrop_keys = [\"a[]\"]",
-                    "2:14: privacy.drop_keys: expected an array of patterns of keys such as "
-                    "\"user_*\", found the string \"a[]\""},
+                    "\"user_*\", found 7"},
+        MistakeCase{"EmptyPattern", "[privacy]\ndrop_keys = [\"a\", \"\"]",
+                    "2:19: privacy.drop_keys: expected a pattern, found the string \"\": an empty "
+                    "pattern matches nothing"},
+        MistakeCase{"ListWithoutEnd", "[privacy]\ndrop_keys = [\"a[[:alpha:]\"]",
+                    "2:14: privacy.drop_keys: expected a pattern, found the string "
+                    "\"a[[:alpha:]\": character 2: the list has no \"]\" at its end"},
+        MistakeCase{"RangeOfNothing", "[privacy]\ndrop_keys = [\"a[z-a]\"]",
+                    "2:14: privacy.drop_keys: expected a pattern, found the string \"a[z-a]\": "
+                    "character 3: the range z-a is empty, because its end is before its start"},
         MistakeCase{"MisspeltRule", "[privacy]\ndrop_key = [\"a\"]",
                     "2:1: privacy.drop_key: expected a known key, found an unknown one; the "
                     "closest is \"drop_keys\""},

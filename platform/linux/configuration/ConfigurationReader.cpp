@@ -12,6 +12,7 @@
 
 #include "platform/linux/base/Utf8.h"
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
+#include "platform/linux/configuration/GlobPattern.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -151,6 +152,27 @@ void TableReader::readTexts(std::string_view key, TextForm matches, std::string_
     texts.push_back(text->get());
   }
   result = std::move(texts);
+}
+
+void TableReader::readPatterns(std::string_view key, std::string_view what,
+                               std::vector<std::string>& result) {
+  const toml::node* node = find(key);
+  if (node == nullptr) return;
+  const std::string list = fmt::format("an array of {}", what);
+  const toml::array* array = node->as_array();
+  if (array == nullptr || array->empty()) return expected(*node, key, list);
+  std::vector<std::string> patterns;
+  for (const toml::node& element : *array) {
+    const auto* text = element.as_string();
+    if (text == nullptr) return expected(element, key, list);
+    if (const auto mistake = findPatternMistake(text->get())) {
+      mistakes_.add(element.source().begin, fmt::format("{}: expected a pattern, found {}: {}",
+                                                        fullName(key), found(element), *mistake));
+      return;
+    }
+    patterns.push_back(text->get());
+  }
+  result = std::move(patterns);
 }
 
 void TableReader::refuse(std::string_view key, std::string_view what) {

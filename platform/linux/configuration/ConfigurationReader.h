@@ -63,6 +63,8 @@ class TableReader {
   void readText(std::string_view key, TextForm matches, std::string_view what, std::string& result);
   void readTexts(std::string_view key, TextForm matches, std::string_view what,
                  std::vector<std::string>& result);
+  // Reads a list of at least one pattern for fnmatch(3). A mistake in a pattern is named.
+  void readPatterns(std::string_view key, std::string_view what, std::vector<std::string>& result);
   // Reads an absolute path of at most `longest` bytes; expands "~/".
   void read(std::string_view key, std::filesystem::path& result, std::size_t longest);
   void read(std::string_view key, NumberRange range, std::uint64_t& result);
