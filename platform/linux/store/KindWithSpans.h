@@ -22,6 +22,9 @@ class KindWithSpans : public RecordKind {
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) final {
     return spans_.deleteOlderThan(time, found);
   }
+  [[nodiscard]] SqliteCode erase(Database& database, ErasePass& pass, bool& more) final {
+    return spans_.erase(database, pass, more);
+  }
 
  protected:
   [[nodiscard]] RecordSpans& spans() { return spans_; }

@@ -5,7 +5,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/linux/store/blocks/MessageBlockReader.h"
+#include "platform/linux/store/EraseSelection.h"
+#include "platform/linux/store/RecordKind.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -17,6 +18,14 @@ constexpr std::uint64_t kRecordsToCompress = 24;
 // that wants one record unpacks a whole block, which takes 1 ms at this size.
 constexpr std::uint64_t kMostRecords = 1024;
 constexpr std::uint64_t kMostBytes = std::uint64_t{256} * 1024;
+
+ErasableRecord erasablePart(const BlockRecord& record) {
+  const bool isLink = record.kind == BlockRecordKind::kLink;
+  return {.kind = isLink ? ErasableRecord::Kind::kLink : ErasableRecord::Kind::kEvent,
+          .application = record.application,
+          .sessionID = record.sessionID,
+          .payload = record.payload};
+}
 
 constexpr const char* kNoSpan = "(SELECT ifnull(max(span), -1) FROM message_spans)";
 
@@ -33,7 +42,7 @@ SqliteCode MessageBlocks::prepare(Database& database) {
         {&statements_.insertSpan, "INSERT OR REPLACE INTO message_spans VALUES (?1, ?2, ?3, ?4)"},
         {&statements_.newest, "SELECT id, records FROM message_blocks ORDER BY id DESC LIMIT 1"},
         {&statements_.openRows,
-         "SELECT id, records, block" + openRows + " AND records > 0 ORDER BY id"},
+         "SELECT id, records, block, last_time" + openRows + " AND records > 0 ORDER BY id"},
         {&statements_.deleteOpenRows, "DELETE FROM message_blocks WHERE id >= ?1"},
         {&statements_.oldest,
          "SELECT id, records, first_time FROM message_blocks WHERE records > 0"
@@ -98,7 +107,8 @@ SqliteCode MessageBlocks::gatherOpenRows() {
   SqliteCode code = SQLITE_ROW;
   while ((code = statements_.openRows.step()) == SQLITE_ROW) {
     const SqliteCode added =
-        gatherBlock(statements_.openRows.bytes(2), statements_.openRows.integer(1), std::nullopt);
+        gatherBlock(statements_.openRows.bytes(2), statements_.openRows.integer(1), {});
+    gathered_.timeOfGaps = statements_.openRows.real(3);
     if (added != SQLITE_OK) {
       code = added;
       break;
@@ -118,15 +128,14 @@ SqliteCode MessageBlocks::sealOpenRows() {
   return code == SQLITE_OK ? insert(Row::kSealed) : code;
 }
 
-// Adds the records of a block to writer_. Records older than `newerThan` become gaps.
+// Adds the records of a block to writer_. Those for which `isGone` returns true become gaps.
 SqliteCode MessageBlocks::gatherBlock(std::string_view block, std::int64_t records,
-                                      std::optional<double> newerThan) {
+                                      const IsGone& isGone) {
   MessageBlockReader reader;  // a member would keep the memory of a long payload
   reader.open(block, records);
   while (reader.next()) {
     const BlockRecord& record = reader.record();
-    const bool isAged = newerThan.has_value() && record.time < *newerThan;
-    if (record.kind == BlockRecordKind::kGap || isAged) {
+    if (record.kind == BlockRecordKind::kGap || (isGone && isGone(reader.index(), record))) {
       writer_.addGap();
       continue;
     }
@@ -182,12 +191,13 @@ SqliteCode MessageBlocks::sealEachOpenRow() {
     std::int64_t id;
     std::int64_t records;
     std::string block;
+    double lastTime;
   };
   std::vector<OpenRow> rows;
   SqliteCode code = SQLITE_ROW;
   while ((code = statements_.openRows.step()) == SQLITE_ROW) {
     rows.push_back({statements_.openRows.integer(0), statements_.openRows.integer(1),
-                    std::string(statements_.openRows.bytes(2))});
+                    std::string(statements_.openRows.bytes(2)), statements_.openRows.real(3)});
   }
   statements_.openRows.reset();
   if (code != SQLITE_DONE) return code;
@@ -196,7 +206,8 @@ SqliteCode MessageBlocks::sealEachOpenRow() {
   for (const OpenRow& row : rows) {
     if (code != SQLITE_OK) break;
     gathered_.first = row.id;
-    code = gatherBlock(row.block, row.records, std::nullopt);
+    gathered_.timeOfGaps = row.lastTime;
+    code = gatherBlock(row.block, row.records, {});
     if (code == SQLITE_OK && row.records > 0) code = insert(Row::kSealed);
   }
   openBytes_ = 0;
@@ -214,6 +225,7 @@ SqliteCode MessageBlocks::end() {
 
 // Writes the records of writer_ into a row.
 SqliteCode MessageBlocks::insert(Row row) {
+  if (!gathered_.hasTimes) gathered_.firstTime = gathered_.lastTime = gathered_.timeOfGaps;
   const bool isShort = row == Row::kOpen && writer_.records() < kRecordsToCompress;
   const std::string_view block =
       writer_.finish(isShort ? BlockPacking::kPlain : BlockPacking::kZstd);
@@ -322,22 +334,94 @@ SqliteCode MessageBlocks::trim(std::int64_t id, double time) {
     statements_.block.reset();
     return code == SQLITE_DONE ? SQLITE_CORRUPT : code;
   }
-  const std::int64_t records = statements_.block.integer(0);
-  if (statements_.block.real(1) < time) {
-    statements_.block.reset();
-    return deleteRow(id, records);
-  }
-  clearGathered();
-  gathered_.first = id;
-  code = gatherBlock(statements_.block.bytes(2), records, time);
+  const StoredBlock row{.id = id,
+                        .records = statements_.block.integer(0),
+                        .lastTime = statements_.block.real(1),
+                        .block = std::string(statements_.block.bytes(2))};
   statements_.block.reset();
+  if (row.lastTime < time) return deleteRow(id, row.records);
+  return rewrite(row, [time](std::int64_t /*number*/, const BlockRecord& record) {
+    return record.time < time;
+  });
+}
+
+SqliteCode MessageBlocks::rewrite(const StoredBlock& row, const IsGone& isGone) {
+  clearGathered();
+  gathered_.first = row.id;
+  gathered_.timeOfGaps = row.lastTime;
+  SqliteCode code = gatherBlock(row.block, row.records, isGone);
   if (code != SQLITE_OK) return code;
-  const bool isOpen = id >= firstOpen_;
+  const bool isOpen = row.id >= firstOpen_;
   const std::int64_t firstOpen = firstOpen_;
+  if (isOpen) openBytes_ -= std::min<std::uint64_t>(openBytes_, row.block.size());
   code = insert(isOpen ? Row::kOpen : Row::kSealed);
   firstOpen_ = firstOpen;
   sealedBytes_ = 0;
   return code;
+}
+
+SqliteCode MessageBlocks::erase(Database& database, ErasePass& pass, bool& more) {
+  more = false;
+  SqliteCode code = readState();
+  if (code != SQLITE_OK) return code;
+  if (pass.last < 0) pass.last = next_ - 1;
+  Statement next;
+  // Open rows may have become one row since the step before. Its ID is lower than `next`.
+  code = database.prepare(
+      "SELECT id, records, last_time, block FROM message_blocks"
+      " WHERE id >= (SELECT ifnull(max(id), 0) FROM message_blocks WHERE id <= ?1)"
+      " AND id <= ?2 AND id + records > ?1 ORDER BY id LIMIT 1",
+      next);
+  if (code != SQLITE_OK) return code;
+  next.bind(1, pass.next);
+  next.bind(2, pass.last);
+  code = next.step();
+  more = code == SQLITE_ROW;
+  if (!more) return code == SQLITE_DONE ? SQLITE_OK : code;
+  const StoredBlock row{.id = next.integer(0),
+                        .records = next.integer(1),
+                        .lastTime = next.real(2),
+                        .block = std::string(next.bytes(3))};
+  next.reset();
+  pass.next = row.id + row.records;
+  return visit(row, pass);
+}
+
+SqliteCode MessageBlocks::visit(const StoredBlock& row, ErasePass& pass) {
+  if (!pass.isLooking) {
+    MessageBlockReader reader;
+    reader.open(row.block, row.records);
+    while (reader.next()) pass.selection->announce(erasablePart(reader.record()));
+  }
+  std::vector<bool> gone;
+  bool hasOthers = false;
+  MessageBlockReader reader;
+  reader.open(row.block, row.records);
+  std::uint64_t erased = 0;
+  while (reader.next()) {
+    const BlockRecord& record = reader.record();
+    if (record.kind == BlockRecordKind::kGap || row.id + reader.index() > pass.last) {
+      hasOthers = hasOthers || record.kind != BlockRecordKind::kGap;
+      gone.push_back(false);
+      continue;
+    }
+    const ErasableRecord part = erasablePart(record);
+    if (pass.isLooking) pass.selection->look(part);
+    gone.push_back(!pass.isLooking && pass.selection->selects(part));
+    hasOthers = hasOthers || !gone.back();
+    erased += gone.back() ? 1U : 0U;
+  }
+  if (reader.isDamaged()) return SQLITE_CORRUPT;
+  if (erased == 0) return SQLITE_OK;
+  pass.erased += erased;
+  SqliteCode code = statements_.oldest.step();
+  const bool isOldest = code == SQLITE_ROW && statements_.oldest.integer(0) == row.id;
+  statements_.oldest.reset();
+  if (code != SQLITE_ROW && code != SQLITE_DONE) return code;
+  if (isOldest && !hasOthers) return deleteRow(row.id, row.records);
+  return rewrite(row, [&gone](std::int64_t number, const BlockRecord& /*record*/) {
+    return gone[static_cast<std::size_t>(number)];
+  });
 }
 
 }  // namespace halvox::platform::linux_

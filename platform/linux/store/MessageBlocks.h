@@ -1,13 +1,18 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <optional>
+#include <string>
 #include <string_view>
 
 #include "platform/linux/store/Sqlite.h"
+#include "platform/linux/store/blocks/MessageBlockReader.h"
 #include "platform/linux/store/blocks/MessageBlockWriter.h"
 
 namespace halvox::platform::linux_ {
+
+struct ErasePass;
 
 // Writes and deletes the rows of `message_blocks`. Each row holds one or more consecutive records;
 // its ID is the number of the first one. Record numbers only grow, even after all records were
@@ -61,6 +66,9 @@ class MessageBlocks {
   // Deletes the records of one block that are older than `time`. If newer records remain, writes
   // the block again with gaps.
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found);
+  // Visits the records of one block. If only some are erased, writes the block again with gaps. A
+  // block of gaps stays, because readers that follow the store would miss its numbers.
+  [[nodiscard]] SqliteCode erase(Database& database, ErasePass& pass, bool& more);
 
  private:
   enum class Row : std::uint8_t { kOpen, kSealed };
@@ -83,14 +91,25 @@ class MessageBlocks {
     bool hasTimes = false;
     double firstTime = 0;
     double lastTime = 0;
+    // A time for a block of gaps, by which retention deletes it.
+    double timeOfGaps = 0;
   };
+  // A row, copied.
+  struct StoredBlock {
+    std::int64_t id = 0;
+    std::int64_t records = 0;
+    double lastTime = 0;
+    std::string block;
+  };
+  // Returns true for a record that becomes a gap. The number is that in the block, from 0.
+  using IsGone = std::function<bool(std::int64_t number, const BlockRecord& record)>;
 
   [[nodiscard]] SqliteCode readState();
   [[nodiscard]] SqliteCode sealOpenRows();
   [[nodiscard]] SqliteCode sealEachOpenRow();
   [[nodiscard]] SqliteCode gatherOpenRows();
   [[nodiscard]] SqliteCode gatherBlock(std::string_view block, std::int64_t records,
-                                       std::optional<double> newerThan);
+                                       const IsGone& isGone);
   void note(double time);
   [[nodiscard]] SqliteCode afterAdding();
   [[nodiscard]] SqliteCode insert(Row row);
@@ -98,6 +117,8 @@ class MessageBlocks {
   void clearGathered();
   [[nodiscard]] SqliteCode deleteRow(std::int64_t id, std::int64_t records);
   [[nodiscard]] SqliteCode trim(std::int64_t id, double time);
+  [[nodiscard]] SqliteCode rewrite(const StoredBlock& row, const IsGone& isGone);
+  [[nodiscard]] SqliteCode visit(const StoredBlock& row, ErasePass& pass);
 
   Statements statements_;
   MessageBlockWriter writer_;

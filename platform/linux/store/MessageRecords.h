@@ -68,6 +68,9 @@ class MessageRecords final : public RecordKind {
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) override {
     return blocks_.deleteOlderThan(time, found);
   }
+  [[nodiscard]] SqliteCode erase(Database& database, ErasePass& pass, bool& more) override {
+    return blocks_.erase(database, pass, more);
+  }
 
  private:
   struct Event {

@@ -37,6 +37,17 @@ struct FinishedRecords {
   std::uint64_t unwritten = 0;     // dropped before they were written
 };
 
+class EraseSelection;
+
+// How far an erasure has come with the records of one kind.
+struct ErasePass {
+  EraseSelection* selection;  // not owned
+  bool isLooking = true;      // only looks at the records; otherwise erases
+  std::int64_t next = 0;      // the first number that was not visited
+  std::int64_t last = -1;     // the newest number when the erasure began; later records stay
+  std::uint64_t erased = 0;   // records
+};
+
 // One kind of record: its tables, its waiting records, and the code that writes and deletes them.
 // The store owns its kinds. Only the writer's thread calls the functions of this class. Derived
 // classes have a function that adds records, which any thread may call. Functions that use the
@@ -81,6 +92,10 @@ class RecordKind {
   // again while it is true.
   [[nodiscard]] virtual SqliteCode deleteOldest(bool& found) = 0;
   [[nodiscard]] virtual SqliteCode deleteOlderThan(double time, bool& found) = 0;
+
+  // Visits the next few records of a pass in the open transaction, and deletes those that it
+  // selects. The numbers of other records stay. Sets `more` to whether records remain.
+  [[nodiscard]] virtual SqliteCode erase(Database& database, ErasePass& pass, bool& more) = 0;
 };
 
 }  // namespace halvox::platform::linux_

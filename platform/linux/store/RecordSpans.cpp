@@ -3,7 +3,10 @@
 #include <algorithm>
 #include <string>
 #include <utility>
+#include <vector>
 
+#include "platform/linux/store/EraseSelection.h"
+#include "platform/linux/store/RecordKind.h"
 #include "platform/linux/store/StoreSchema.h"
 
 namespace halvox::platform::linux_ {
@@ -24,6 +27,25 @@ std::string withTables(std::string_view sql, std::string_view records, std::stri
     }
   }
   return result;
+}
+
+// Returns what an erasure must know of the row, whichever table it is of.
+ErasableRecord erasableRow(const Statement& row) {
+  ErasableRecord record;
+  for (int column = 0; column < row.columns(); ++column) {
+    const std::string_view name = row.columnName(column);
+    if (name == "name_id") record.kind = ErasableRecord::Kind::kEvent;
+    if (name == "session_id") {
+      record.kind = ErasableRecord::Kind::kLink;
+      record.sessionID = row.integer(column);
+    }
+    if (name == "payload" || name == "signature" || name == "message") {
+      record.payload = row.bytes(column);
+    }
+    // The record of a capture. An erasure deletes the captures themselves too.
+    record.isOfAll = record.isOfAll || name == "path";
+  }
+  return record;
 }
 
 }  // namespace
@@ -148,6 +170,56 @@ SqliteCode RecordSpans::deleteOlderThan(double time, bool& found) {
   statements_.shortenSpan.bind(1, span);
   statements_.shortenSpan.bind(2, time);
   return statements_.shortenSpan.run();
+}
+
+SqliteCode RecordSpans::erase(Database& database, ErasePass& pass, bool& more) {
+  more = false;
+  if (pass.last < 0) pass.last = next_ - 1;
+  Statement rows;
+  SqliteCode code = database.prepare(
+      withTables("SELECT * FROM $records WHERE id BETWEEN ?1 AND ?2 ORDER BY id LIMIT ?3",
+                 recordsTable_, spansTable_),
+      rows);
+  if (code != SQLITE_OK) return code;
+  rows.bind(1, pass.next);
+  rows.bind(2, pass.last);
+  rows.bind(3, kRecordsPerStep);
+  std::vector<std::int64_t> selected;
+  while ((code = rows.step()) == SQLITE_ROW) {
+    more = true;
+    pass.next = rows.integer(0) + 1;
+    const ErasableRecord record = erasableRow(rows);
+    if (pass.isLooking) {
+      pass.selection->look(record);
+    } else if (pass.selection->selects(record)) {
+      selected.push_back(rows.integer(0));
+    }
+  }
+  rows.reset();
+  if (code != SQLITE_DONE) return code;
+  for (const std::int64_t id : selected) {
+    statements_.deleteRecords.bind(1, id);
+    statements_.deleteRecords.bind(2, id);
+    code = statements_.deleteRecords.run();
+    if (code != SQLITE_OK) return code;
+  }
+  pass.erased += selected.size();
+  return selected.empty() ? SQLITE_OK : keepNext(database);
+}
+
+// The next number derives from the newest record. If that was erased, adds an empty span, after
+// which numbering continues when the database is opened again.
+SqliteCode RecordSpans::keepNext(Database& database) const {
+  Statement add;
+  const SqliteCode code = database.prepare(
+      withTables("INSERT OR IGNORE INTO $spans SELECT ?2, last_time, last_time FROM $spans"
+                 " WHERE span = ?2 - 1 AND ifnull((SELECT max(id) FROM $records), 0) < ?1",
+                 recordsTable_, spansTable_),
+      add);
+  if (code != SQLITE_OK) return code;
+  add.bind(1, nextCommitted_ - 1);
+  add.bind(2, (nextCommitted_ - 1) / kRecordsPerSpan + 1);
+  return add.run();
 }
 
 }  // namespace halvox::platform::linux_

@@ -8,6 +8,8 @@
 
 namespace halvox::platform::linux_ {
 
+struct ErasePass;
+
 // Numbers the records of one kind, and stores the first and the last time of each span of
 // kRecordsPerSpan records. Deletes the oldest records by number, or by time with the help of the
 // spans, which make an index on the time unnecessary.
@@ -43,6 +45,7 @@ class RecordSpans {
   [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time);
   [[nodiscard]] SqliteCode deleteOldest(bool& found);
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found);
+  [[nodiscard]] SqliteCode erase(Database& database, ErasePass& pass, bool& more);
 
  private:
   struct Statements {
@@ -62,6 +65,7 @@ class RecordSpans {
   };
 
   [[nodiscard]] SqliteCode readNext(Database& database);
+  [[nodiscard]] SqliteCode keepNext(Database& database) const;
 
   const std::string_view recordsTable_;
   const std::string_view spansTable_;

@@ -58,6 +58,9 @@ class Statement {
   }
   [[nodiscard]] std::string_view text(int column) const;
   [[nodiscard]] std::string_view bytes(int column) const;
+  [[nodiscard]] std::string_view columnName(int column) const {
+    return sqlite3_column_name(handle_.get(), column);
+  }
   [[nodiscard]] int columns() const { return sqlite3_column_count(handle_.get()); }
 
  private:

@@ -71,7 +71,8 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
                   .databaseBytes = sizes_.databaseBytes,
                   .transactionBytes = sizes_.transactionBytes}),
       runs_(environment.clock, options.bootID),
-      vacuum_(files_.database()) {}
+      vacuum_(files_.database()),
+      erase_(ErasePlaces{options.directory, options.root}) {}
 
 Result<void, StoreError> SqliteStore::open() {
   configureLibrary();
@@ -85,6 +86,7 @@ Result<void, StoreError> SqliteStore::open() {
 
 void SqliteStore::close() {
   vacuum_.cancel();
+  erase_.cancel();
   queue_.close();
   if (writer_.joinable()) writer_.join();
 }
@@ -104,6 +106,7 @@ void SqliteStore::run() {
     writeTaken();
     maintainWhileIdle();
     vacuumOnce();
+    eraseOnce();
     releaseMemoryIfIdle();
   }
   writeEnd();
@@ -380,6 +383,42 @@ void SqliteStore::vacuumOnce() {
               " bytes");
 }
 
+bool SqliteStore::beginErase(const EraseRequest& request) {
+  if (!erase_.begin(request)) return false;
+  kLog.notice("an erasure of ",
+              request.application ? "one application"
+              : request.session   ? "one session"
+                                  : "everything before a time",
+              " begins");
+  queue_.requestRound();
+  return true;
+}
+
+EraseState SqliteStore::eraseState() {
+  EraseState state = erase_.state();
+  if (state.isRunning && state.isLogHeld) queue_.requestRound();
+  return state;
+}
+
+// Runs one step of an erasure, like vacuumOnce().
+void SqliteStore::eraseOnce() {
+  if (!erase_.isRunning()) return;
+  if (!database_.isOpen()) return erase_.fail("the database is not open");
+  errno = 0;
+  const SqliteCode code = erase_.runOnce(database_, kinds_);
+  if (code != SQLITE_OK) {
+    erase_.fail(sqlite3_errstr(code));
+    fail(code, "cannot erase in the database");
+    if (database_.isOpen()) StoreErase::resetConnection(database_);
+    return;
+  }
+  const EraseState state = erase_.state();
+  // While a reader holds the log, only new records and eraseState() make it try again.
+  if (state.isRunning) return state.isLogHeld ? void() : queue_.requestRound();
+  kLog.notice("the erasure has ended; ", state.records, " records and ", state.files,
+              " files were erased");
+}
+
 void SqliteStore::closeDatabase() {
   const bool isChecked = check_.stop();
   releaseStatements();
@@ -406,6 +445,7 @@ void SqliteStore::releaseStatements() {
   retention_.release();
   runs_.release();
   vacuum_.release();
+  erase_.release();
   for (RecordKind* const kind : kinds_) kind->release();
 }
 

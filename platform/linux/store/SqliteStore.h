@@ -20,6 +20,7 @@
 #include "platform/linux/store/ServiceRuns.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreCheck.h"
+#include "platform/linux/store/StoreErase.h"
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/StoreExtent.h"
 #include "platform/linux/store/StoreFiles.h"
@@ -34,6 +35,7 @@ namespace halvox::platform::linux_ {
 
 struct StoreOptions {
   std::filesystem::path directory;
+  std::filesystem::path root{};  // where summary files are, which an erasure deletes
   std::uint32_t retentionDays = defaults::kRetentionDays;
   std::uint32_t maxMegabytes = defaults::kStorageMegabytes;        // database and log together
   std::vector<std::string> wantedEvents{defaults::kWantedEvents};  // patterns for fnmatch(3)
@@ -106,6 +108,10 @@ class SqliteStore {
   bool beginVacuum(const VacuumRequest& request);
   // How the vacuum is getting on, or how the last one ended. Any thread may call.
   [[nodiscard]] VacuumState vacuumState() { return vacuum_.state(); }
+  // The same for an erasure. While an erasure waits for a reader that holds the log, each call of
+  // eraseState() makes it try again.
+  bool beginErase(const EraseRequest& request);
+  [[nodiscard]] EraseState eraseState();
 
  private:
   using Time = WriterQueue::Time;
@@ -130,6 +136,7 @@ class SqliteStore {
   void onStored();
   void maintainWhileIdle();
   void vacuumOnce();
+  void eraseOnce();
   void releaseMemoryIfIdle();
   [[nodiscard]] bool maintainOnce();
   void closeDatabase();
@@ -161,6 +168,7 @@ class SqliteStore {
   Retention retention_;
   ServiceRuns runs_;
   StoreVacuum vacuum_;
+  StoreErase erase_;
   Time nextRound_{};
   std::uint64_t droppedSinceStored_ = 0;
   std::uint64_t bytesSinceRelease_ = 0;  // of payloads, since memory was last released

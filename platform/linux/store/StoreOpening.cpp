@@ -1,7 +1,6 @@
 #include "platform/linux/store/StoreOpening.h"
 
 #include <algorithm>
-#include <chrono>
 #include <string>
 
 #include "platform/linux/store/StoreLog.h"
@@ -23,9 +22,6 @@ constexpr std::uint64_t kLargestLog = 4 * kMegabyte;
 constexpr std::uint64_t kLargestTransaction = 2 * kMegabyte;
 // Must be less than the 1,000,000,000 bytes that SQLite accepts for one value.
 constexpr std::uint64_t kLargestPayload = 256 * kMegabyte;
-// How long the writer waits for a lock of another process before it drops the records being
-// written. This is half of the time (500 ms) within which readers must see a record.
-constexpr std::chrono::milliseconds kBusyTimeout{250};
 
 Failure<StoreError> failure(StoreError code, const StoreFiles& files, const std::string& what) {
   return {code, files.database().native() + ": " + what};
@@ -61,7 +57,7 @@ Result<void, StoreError> examine(const StoreFiles& files, Database& database) {
   if (code != SQLITE_OK) return judged(code, files, database);
   // Set the time-out before the first statement, because another program may hold a lock while the
   // service starts.
-  sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
+  sqlite3_busy_timeout(database.get(), static_cast<int>(kWriterBusyTimeout.count()));
   // Read the first page. This detects a file that is not a database before anything changes it.
   code = database.execute("PRAGMA schema_version");
   if (code != SQLITE_OK) return judged(code, files, database);

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 
 #include "platform/linux/base/Result.h"
@@ -8,6 +9,10 @@
 #include "platform/linux/store/StoreFiles.h"
 
 namespace halvox::platform::linux_ {
+
+// How long the writer waits for a lock of another process before it drops the records being
+// written. This is half of the time (500 ms) within which readers must see a record.
+constexpr std::chrono::milliseconds kWriterBusyTimeout{250};
 
 // How large the parts of a store may become. All sizes derive from the size in the configuration.
 struct StoreSizes {

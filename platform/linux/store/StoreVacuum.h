@@ -15,6 +15,7 @@
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/StoreOpening.h"
+#include "platform/value.h"
 
 namespace halvox::platform::linux_ {
 
@@ -35,6 +36,9 @@ struct VacuumState {
   bool isLogHeld = false;  // a reader keeps the write-ahead log; SQLite empties it later
   std::string problem{};   // empty unless it failed
 };
+
+// The state as the interface com.tarno.halvox.Storage has it.
+[[nodiscard]] Dictionary describe(const VacuumState& state);
 
 // Deletes records and gives their space back, as retention does but with the limits of one request.
 // Works in small transactions, between which the writer stores records.
@@ -67,13 +71,11 @@ class StoreVacuum {
   // The step of deleting, of shrinking the file and of emptying its log.
   struct Step {
     Retention retention;
-    Statement shrink;
     double before;  // Retention deletes what is older than that; 0: nothing is
     bool isDeleting = true;
   };
 
   [[nodiscard]] SqliteCode prepare(Database& database);
-  [[nodiscard]] SqliteCode shrink(Database& database, bool& more);
   [[nodiscard]] SqliteCode finish(Database& database) HALVOX_EXCLUDES(mutex_);
   void noteBytes() HALVOX_EXCLUDES(mutex_);
 

@@ -14,6 +14,11 @@
 
 namespace halvox::platform::linux_ {
 
+// An erasure leaves an empty message in the place of one that it has erased.
+[[nodiscard]] inline bool isErased(const SpooledMessage& message) {
+  return message.subject.empty();
+}
+
 // A row of the table link_spool holds consecutive messages. They resemble each other, and zstd
 // makes about a tenth of them:
 //

@@ -23,6 +23,9 @@ class SpoolTable {
   // Sets `row` to the oldest row; std::nullopt if the table is empty.
   [[nodiscard]] SqliteCode readOldest(std::optional<Row>& row);
   [[nodiscard]] SqliteCode remove(const Row& row);
+  // Visits the next row of a pass; see RecordKind::erase(). An erased message leaves an empty one
+  // in its place, so that the numbers of the others stay.
+  [[nodiscard]] static SqliteCode erase(Database& database, ErasePass& pass, bool& more);
 
  private:
   Statement oldest_;
@@ -44,6 +47,9 @@ class StoredSpool final : public RecordKind {
   [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) override;
   [[nodiscard]] SqliteCode deleteOldest(bool& found) override;
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) override;
+  [[nodiscard]] SqliteCode erase(Database& database, ErasePass& pass, bool& more) override {
+    return SpoolTable::erase(database, pass, more);
+  }
 
  private:
   SpoolTable table_;

@@ -51,6 +51,9 @@ class SpooledMessages final : public RecordKind {
   [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) override;
   [[nodiscard]] SqliteCode deleteOldest(bool& found) override;
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) override;
+  [[nodiscard]] SqliteCode erase(Database& database, ErasePass& pass, bool& more) override {
+    return SpoolTable::erase(database, pass, more);
+  }
 
  private:
   struct Numbered {

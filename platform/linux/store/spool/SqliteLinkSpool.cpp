@@ -64,7 +64,7 @@ Result<LinkSpool::Read, StoreError> SqliteLinkSpool::readAfter(Number after) {
     }
     Number number = first;
     for (SpooledMessage& message : *unpacked) {
-      if (number > after && number >= firstUnsent) {
+      if (number > after && number >= firstUnsent && !isErased(message)) {
         read.messages.emplace_back(number, std::move(message));
       }
       ++number;
