@@ -256,6 +256,11 @@ class HalvoxConnection {
   Result<bool> beginVacuum(const Dictionary& options);
   /// Returns how the vacuum is getting on, or how the last one ended. For the same users.
   Result<Dictionary> vacuumState();
+  /// Begins to erase what the service stored: of the application "app", of the session "session",
+  /// or everything "before" a time (seconds since 1970). Exactly one of them. For the same users.
+  Result<bool> beginErase(const Dictionary& options);
+  /// Returns how the erasure is getting on, or how the last one ended. For the same users.
+  Result<Dictionary> eraseState();
   /// Ends the service. The service does not answer this request. The result true means that the
   /// connection has ended. Only root and the user that the service runs as may do this; others are
   /// refused.

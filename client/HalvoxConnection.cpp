@@ -292,6 +292,16 @@ Result<Dictionary> HalvoxConnection::vacuumState() {
   return readDictionary(impl_->ask(makeVacuumStateRequest()));
 }
 
+Result<bool> HalvoxConnection::beginErase(const Dictionary& options) {
+  auto answer = impl_->ask(makeBeginEraseRequest(options));
+  if (!answer) return failed<bool>(std::move(*answer.failure));
+  return {true, std::nullopt};
+}
+
+Result<Dictionary> HalvoxConnection::eraseState() {
+  return readDictionary(impl_->ask(makeEraseStateRequest()));
+}
+
 Result<std::vector<ReporterID>> HalvoxConnection::getAllReporters() {
   using IDs = std::vector<ReporterID>;
   auto answer = impl_->ask(makeRequest("getAllReporters"));

@@ -239,6 +239,15 @@ Request makeVacuumStateRequest() {
   return make(makeHeader("GetVacuum", "", kStorageInterface), [](SegmentWriter&) {});
 }
 
+Request makeBeginEraseRequest(const Dictionary& options) {
+  return makeWithDictionary(makeHeader("BeginErase", "a{sv}", kStorageInterface), options,
+                            [](SegmentWriter&) {});
+}
+
+Request makeEraseStateRequest() {
+  return make(makeHeader("GetErase", "", kStorageInterface), [](SegmentWriter&) {});
+}
+
 Request makeRequest(const char* member, ReporterID id) {
   return make(makeHeader(member, "x"), [id](SegmentWriter& writer) { writer.number(id); });
 }

@@ -56,6 +56,8 @@ Request makeCountersRequest();
 // The requests of the service's interface for its store.
 Request makeBeginVacuumRequest(const Dictionary& options);
 Request makeVacuumStateRequest();
+Request makeBeginEraseRequest(const Dictionary& options);
+Request makeEraseStateRequest();
 
 // Sets the serial of a frame. It must not be 0. At least the first 12 bytes of the frame must be at
 // `frame`.

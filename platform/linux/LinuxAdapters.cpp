@@ -8,6 +8,7 @@
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/store/StoreErase.h"
 #include "platform/linux/store/StoreVacuum.h"
 
 namespace halvox::platform::linux_ {
@@ -40,6 +41,28 @@ Dictionary readCounters(const CounterStatisticsService& statistics) {
   return counters;
 }
 
+std::string beginErase(SqliteStore& store, const Dictionary& options) {
+  EraseRequest request;
+  for (const auto& [name, value] : options) {
+    if (name.text() == "app" && !value.string().empty()) {
+      request.application = value.string();
+    } else if (name.text() == "session" && value.isNumber() && value.toInt64() != 0) {
+      request.session = value.toInt64();
+    } else if (name.text() == "before" && value.isNumber()) {
+      request.before = value.toDouble();
+    } else {
+      return "expected one of the options \"app\" with a name, \"session\" with a number other "
+             "than 0, and \"before\" with a time, found \"" +
+             std::string(name.text()) + '"';
+    }
+  }
+  if (options.size() != 1) {
+    return "expected one of the options \"app\", \"session\" and \"before\", found " +
+           std::to_string(options.size());
+  }
+  return store.beginErase(request) ? "" : "an erasure runs already; wait until it ends";
+}
+
 // Runs on the I/O thread; the store outlives it.
 StorageControl storageControl(SqliteStore& store) {
   const auto begin = [&store](const Dictionary& options) -> std::string {
@@ -59,20 +82,16 @@ StorageControl storageControl(SqliteStore& store) {
     }
     return store.beginVacuum(request) ? "" : "a vacuum runs already; wait until it ends";
   };
-  const auto state = [&store] {
-    const VacuumState now = store.vacuumState();
-    return Dictionary{{"running", now.isRunning},
-                      {"before", now.bytesBefore},
-                      {"bytes", now.bytes},
-                      {"log held", now.isLogHeld},
-                      {"problem", now.problem}};
-  };
-  return {.beginVacuum = begin, .vacuumState = state};
+  return {.beginVacuum = begin,
+          .vacuumState = [&store] { return describe(store.vacuumState()); },
+          .beginErase = [&store](const Dictionary& options) { return beginErase(store, options); },
+          .eraseState = [&store] { return describe(store.eraseState()); }};
 }
 
 StoreOptions storeOptions(const Configuration& configuration) {
   StoreOptions options;
   options.directory = configuration.storage.directory;
+  options.root = configuration.storage.root;
   options.retentionDays = configuration.storage.retentionDays;
   options.maxMegabytes = configuration.storage.maxMegabytes;
   options.wantedEvents = configuration.analytics.wanted;

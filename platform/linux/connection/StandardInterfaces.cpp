@@ -46,15 +46,17 @@ StandardAnswer getCounters(const StandardRequest& request) {
   return {.value = Value(request.counters ? request.counters() : Dictionary{})};
 }
 
-StandardAnswer beginVacuum(const StandardRequest& request) {
-  const auto& begin = request.storage.beginVacuum;
+template <auto Begin>
+StandardAnswer beginWork(const StandardRequest& request) {
+  const auto& begin = request.storage.*Begin;
   std::string problem = begin ? begin(request.arguments[0].dictionary()) : "there is no store";
   if (problem.empty()) return {};
   return {.errorName = error_names::kFailed, .errorText = std::move(problem)};
 }
 
-StandardAnswer getVacuum(const StandardRequest& request) {
-  const auto& state = request.storage.vacuumState;
+template <auto State>
+StandardAnswer getWork(const StandardRequest& request) {
+  const auto& state = request.storage.*State;
   return {.value = Value(state ? state() : Dictionary{})};
 }
 
@@ -70,10 +72,14 @@ constexpr std::array kObjectMethods = {
     StandardMethod{kProperties, "GetAll", "s", "a{sv}", StandardScope::kObject, noProperties},
     StandardMethod{kProperties, "Set", "ssv", "", StandardScope::kObject, unknownProperty},
     StandardMethod{kStatistics, "GetCounters", "", "a{sv}", StandardScope::kObject, getCounters},
-    StandardMethod{kStorage, "BeginVacuum", "a{sv}", "", StandardScope::kObject, beginVacuum,
-                   MethodAccess::kOwner},
-    StandardMethod{kStorage, "GetVacuum", "", "a{sv}", StandardScope::kObject, getVacuum,
-                   MethodAccess::kOwner},
+    StandardMethod{kStorage, "BeginVacuum", "a{sv}", "", StandardScope::kObject,
+                   beginWork<&StorageControl::beginVacuum>, MethodAccess::kOwner},
+    StandardMethod{kStorage, "GetVacuum", "", "a{sv}", StandardScope::kObject,
+                   getWork<&StorageControl::vacuumState>, MethodAccess::kOwner},
+    StandardMethod{kStorage, "BeginErase", "a{sv}", "", StandardScope::kObject,
+                   beginWork<&StorageControl::beginErase>, MethodAccess::kOwner},
+    StandardMethod{kStorage, "GetErase", "", "a{sv}", StandardScope::kObject,
+                   getWork<&StorageControl::eraseState>, MethodAccess::kOwner},
 };
 
 bool isExportedObject(const ClientConnection& client, std::string_view path) {

@@ -159,6 +159,24 @@ TEST(StandardInterfacesTest, WithoutAStoreThereIsNoVacuum) {
   EXPECT_EQ(client.callAt(kTestPath, kStorage, "GetVacuum").errorName, "");
 }
 
+TEST(StandardInterfacesTest, TheStoreGetsTheSelectionOfAnErasure) {
+  std::string wanted;
+  const ServiceUnderTest service([&](ConnectionOptions& options) {
+    options.storage.beginErase = [&wanted](const Dictionary& given) {
+      wanted = given.find("app")->string();
+      return std::string();
+    };
+  });
+  BusClient client(service.address());
+  const int result =
+      sd_bus_call_method(client.get(), kServiceName, kTestPath, kStorage, "BeginErase", nullptr,
+                         nullptr, "a{sv}", 1, "app", "s", "player");
+
+  EXPECT_GE(result, 0);
+  EXPECT_EQ(wanted, "player");
+  EXPECT_EQ(client.callAt(kTestPath, kStorage, "GetErase").errorName, "");
+}
+
 TEST(StandardInterfacesTest, EveryPeerGetsAUniqueNameOnce) {
   const ServiceUnderTest service;
   BusClient first(service.address());

@@ -16,6 +16,9 @@ struct StorageControl {
   std::function<std::string(const Dictionary& options)> beginVacuum;
   // Returns how the vacuum is getting on, or how the last one ended.
   std::function<Dictionary()> vacuumState;
+  // The same for an erasure. The only option is "app", a name, "session", a number, or "before".
+  std::function<std::string(const Dictionary& options)> beginErase;
+  std::function<Dictionary()> eraseState;
 };
 
 }  // namespace halvox::platform::linux_
