@@ -124,6 +124,10 @@ class DeletingRecords(AccessTest):
             self.vacuum(stranger)
         with self.assertRaisesRegex(GLib.Error, ACCESS_DENIED):
             stranger.call("GetVacuum", interface="com.tarno.halvox.Storage")
+        with self.assertRaisesRegex(GLib.Error, ACCESS_DENIED):
+            stranger.call("BeginErase", "a{sv}", {}, interface="com.tarno.halvox.Storage")
+        with self.assertRaisesRegex(GLib.Error, ACCESS_DENIED):
+            stranger.call("GetErase", interface="com.tarno.halvox.Storage")
 
     def test_the_command_says_why(self):
         service = self.system_service().start()

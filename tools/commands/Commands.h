@@ -21,7 +21,7 @@ void addReportCommand(CommandSet& commands);     // report
 void addSnapshotCommands(CommandSet& commands);  // snapshots
 void addSummaryCommand(CommandSet& commands);    // summary
 void addVerifyCommand(CommandSet& commands);     // verify
-void addStorageCommands(CommandSet& commands);   // vacuum
+void addStorageCommands(CommandSet& commands);   // vacuum, erase
 void addTraceCommands(CommandSet& commands);     // trace
 void addDriverCommand(CommandSet& commands);     // drivers
 void addSettingsCommands(CommandSet& commands);  // preferences, notify

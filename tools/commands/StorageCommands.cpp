@@ -1,6 +1,7 @@
 #include <memory>
 #include <string>
 
+#include "tools/Erase.h"
 #include "tools/OfferedValues.h"
 #include "tools/TimeText.h"
 #include "tools/Vacuum.h"
@@ -19,9 +20,7 @@ platform::linux_::Result<double> parsePastTime(std::string_view text) {
   return time;
 }
 
-}  // namespace
-
-void addStorageCommands(CommandSet& commands) {
+void addVacuumCommand(CommandSet& commands) {
   const auto request = std::make_shared<VacuumStore>();
   CLI::App& vacuum = commands.add(
       {.name = "vacuum",
@@ -48,6 +47,52 @@ void addStorageCommands(CommandSet& commands) {
         return *request;
       },
       vacuumStore);
+}
+
+void addEraseCommand(CommandSet& commands) {
+  const auto request = std::make_shared<EraseStored>();
+  CLI::App& erase = commands.add(
+      {.name = "erase",
+       .summary = "Erase an application, a session or a time from all files of the service",
+       .example = "halvoxctl erase --app org.example.player",
+       .details =
+           "Afterwards, none of the erased bytes is in the database, its log, summaries of "
+           "sessions "
+           "or captures. Captures hold lines of every client: --app and --session delete all of "
+           "them. Databases that were set aside because they were damaged are deleted too. The "
+           "running service does the work and goes on storing records; only root and its own user "
+           "may ask it. If no service runs, halvoxctl does it. Not reached: what was sent to NATS "
+           "servers, the system's journal, exports, reports, traces, and what running sessions "
+           "still hold in memory and report when they stop."});
+  auto* app = addParsed(erase, "--app", request->application, parseErasedApplication,
+                        "Erase what has this name of an application (HostApplicationDisplayID)")
+                  ->type_name("NAME");
+  offerLive(app, "applications");
+  auto* session = addParsed(erase, "--session", request->session, parseErasedSession,
+                            "Erase the link messages of this session and the events of the same "
+                            "messages")
+                      ->type_name("ID");
+  offerLive(session, "stored_sessions");
+  auto* before = addParsed(erase, "--before", request->before, parsePastTime,
+                           "Erase what is older: 7d, 2h, 2026-11-21")
+                     ->type_name("TIME");
+  offerWords(before, {"today", "yesterday", "1d", "1w", "30d"});
+  commands.onRun(
+      erase,
+      [request, app, session, before] {
+        if (app->count() + session->count() + before->count() != 1) {
+          throw CLI::ValidationError("expected one of --app, --session and --before");
+        }
+        return *request;
+      },
+      eraseStored);
+}
+
+}  // namespace
+
+void addStorageCommands(CommandSet& commands) {
+  addVacuumCommand(commands);
+  addEraseCommand(commands);
 }
 
 }  // namespace halvox::tools
