@@ -9,6 +9,7 @@
 
 #include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/store/reading/EventFollower.h"
+#include "platform/linux/store/spool/SqliteLinkSpool.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -104,6 +105,43 @@ TEST_F(StoreEraseTest, ASessionGoesWithTheEventsOfItsMessages) {
 
   EXPECT_THAT(texts(), ElementsAre("public", "link public"));
   EXPECT_THAT(filesWith("SECRET"), IsEmpty());
+}
+
+TEST_F(StoreEraseTest, MessagesThatWaitForAServerGoToo) {
+  start();
+  SqliteLinkSpool spool(*store);
+  const auto keep = [&](const std::string& application, int session, const std::string& text) {
+    ASSERT_NE(spool.append({"halvox.media_session." + std::to_string(session), text,
+                            R"({"userInfo":{"HostApplicationDisplayID":")" + application +
+                                R"("},"payload":{"text":")" + text + R"("}})"}),
+              0U);
+  };
+  keep("player", 1, "SECRET one");
+  keep("browser", 2, "public");
+  keep("player", 1, "SECRET two");
+  keep("browser", 3, "of session three");
+  ASSERT_TRUE(eventually([&] { return !spool.hasUnstored(); }));
+  const auto kept = [&] {
+    std::vector<std::string> found;
+    LinkSpool::Number after = 0;
+    for (auto read = spool.readAfter(after); read && read->through != after;
+         read = spool.readAfter(after)) {
+      for (const auto& [number, message] : read->messages) {
+        found.push_back(std::to_string(number) + " " + message.identifier);
+      }
+      after = read->through;
+    }
+    return found;
+  };
+
+  EXPECT_EQ(erase({.application = "player"}).records, 2U);
+  EXPECT_THAT(kept(), ElementsAre("2 public", "4 of session three"));
+  EXPECT_EQ(erase({.session = 3}).records, 1U);
+  EXPECT_THAT(kept(), ElementsAre("2 public"));
+
+  EXPECT_THAT(filesWith("SECRET"), IsEmpty());
+  EXPECT_THAT(filesWith("session three"), IsEmpty());
+  EXPECT_THAT(complaints(), ElementsAre("ok"));
 }
 
 TEST_F(StoreEraseTest, WhatIsOlderThanATimeGoes) {
