@@ -17,7 +17,6 @@ constexpr int kPasses = 2;
 constexpr std::uint32_t kPagesPerStep = 2048;
 
 // https://www.sqlite.org/fileformat2.html
-constexpr std::size_t kReservedAt = 20;          // in the first page: unused bytes of each page
 constexpr std::size_t kFirstTrunkAt = 32;        // in the first page: the list of free pages
 constexpr std::size_t kFileHeader = 100;         // before the tree in the first page
 constexpr std::uint32_t kLockByte = 0x40000000;  // SQLite uses no page that has it
@@ -91,7 +90,11 @@ std::optional<Cell> cellAt(Bytes page, unsigned char type, std::size_t at) {
 }  // namespace
 
 bool PageCleaner::canClean(Database& database) {
-  return database.queryInteger("PRAGMA auto_vacuum").value_or(0) != 0;
+  int reserved = -1;  // asks, and changes nothing
+  return database.queryInteger("PRAGMA auto_vacuum").value_or(0) != 0 &&
+         sqlite3_file_control(database.get(), "main", SQLITE_FCNTL_RESERVE_BYTES, &reserved) ==
+             SQLITE_OK &&
+         reserved == 0;
 }
 
 SqliteCode PageCleaner::cleanOnce(Database& database, bool& more, bool& isHeld) {
@@ -117,11 +120,6 @@ SqliteCode PageCleaner::cleanSome(Database& database, bool& more) {
   pageBytes_ = static_cast<std::uint32_t>(database.queryInteger("PRAGMA page_size").value_or(0));
   pages_ = static_cast<std::uint32_t>(database.queryInteger("PRAGMA page_count").value_or(0));
   mapNumber_ = 0;
-  Page first;
-  usable_ = pageBytes_;
-  code = read(1, first);
-  if (code != SQLITE_OK) return code;
-  usable_ = pageBytes_ - first[kReservedAt];
   code = cleanFreePages();
   const std::uint32_t end = std::min(pages_, next_ + kPagesPerStep - 1);
   for (; code == SQLITE_OK && next_ <= end; ++next_) code = cleanPage(next_);
@@ -138,19 +136,19 @@ SqliteCode PageCleaner::cleanFreePages() {
   SqliteCode code = read(1, trunk);
   std::uint32_t number = code == SQLITE_OK ? number32(trunk, kFirstTrunkAt) : 0;
   for (std::uint32_t count = 0; code == SQLITE_OK && number != 0; ++count) {
-    if (number > pages_ || count > pages_) return SQLITE_CORRUPT;
+    if (number > pages_ || count > pages_) return kUnexpectedForm;
     code = read(number, trunk);
     if (code != SQLITE_OK) return code;
     const std::size_t leaves = number32(trunk, 4);
-    if (8 + 4 * leaves > usable_) return SQLITE_CORRUPT;
+    if (8 + 4 * leaves > pageBytes_) return kUnexpectedForm;
     Page leaf;
     for (std::size_t index = 0; code == SQLITE_OK && index < leaves; ++index) {
       const std::uint32_t at = number32(trunk, 8 + 4 * index);
-      if (at < 2 || at > pages_) return SQLITE_CORRUPT;
+      if (at < 2 || at > pages_) return kUnexpectedForm;
       code = read(at, leaf);
-      if (code == SQLITE_OK) code = zero(at, leaf, 0, usable_);
+      if (code == SQLITE_OK) code = zero(at, leaf, 0, pageBytes_);
     }
-    if (code == SQLITE_OK) code = zero(number, trunk, 8 + 4 * leaves, usable_);
+    if (code == SQLITE_OK) code = zero(number, trunk, 8 + 4 * leaves, pageBytes_);
     number = number32(trunk, 0);
   }
   return code;
@@ -170,7 +168,7 @@ SqliteCode PageCleaner::cleanPage(std::uint32_t number) {
 SqliteCode PageCleaner::isTree(std::uint32_t number, bool& result) {
   result = number == 1;
   if (number == 1 || number == kLockByte / pageBytes_ + 1) return SQLITE_OK;
-  const std::uint32_t perMap = usable_ / kMapEntry + 1;
+  const std::uint32_t perMap = pageBytes_ / kMapEntry + 1;
   std::uint32_t map = (number - 2) / perMap * perMap + 2;
   if (map == kLockByte / pageBytes_ + 1) ++map;
   if (number <= map) return SQLITE_OK;  // the page map itself
@@ -180,55 +178,60 @@ SqliteCode PageCleaner::isTree(std::uint32_t number, bool& result) {
     mapNumber_ = map;
   }
   const std::size_t entry = std::size_t{kMapEntry} * (number - map - 1);
-  if (entry >= usable_) return SQLITE_CORRUPT;
+  if (entry >= pageBytes_) return kUnexpectedForm;
   result = map_[entry] == kRoot || map_[entry] == kTree;
   return SQLITE_OK;
 }
 
 SqliteCode PageCleaner::cleanTree(std::uint32_t number, Page& page) {
-  const Bytes bytes(page.data(), usable_);
+  const Bytes bytes(page.data(), pageBytes_);
   const std::size_t header = number == 1 ? kFileHeader : 0;
   const unsigned char type = page[header];
   const bool isLeaf = type == kTableLeaf || type == kIndexLeaf;
-  if (!isLeaf && type != kTableInner && type != kIndexInner) return SQLITE_CORRUPT;
+  if (!isLeaf && type != kTableInner && type != kIndexInner) return kUnexpectedForm;
   const std::size_t cells = number16(bytes, header + 3);
   const std::size_t pointers = header + (isLeaf ? 8 : 12);
   const std::size_t content = pointers + 2 * cells;
-  if (content > usable_) return SQLITE_CORRUPT;
+  if (content > pageBytes_) return kUnexpectedForm;
   std::vector<std::pair<std::size_t, std::size_t>> used;  // begin and end
+  std::vector<Cell> overflowing;
   for (std::size_t index = 0; index < cells; ++index) {
     const std::size_t at = number16(bytes, pointers + 2 * index);
     const auto cell = at < content ? std::nullopt : cellAt(bytes, type, at);
-    if (!cell || cell->end > usable_) return SQLITE_CORRUPT;
+    if (!cell || cell->end > pageBytes_) return kUnexpectedForm;
     used.emplace_back(at, cell->end);
-    if (cell->overflow == 0) continue;
-    const SqliteCode code = cleanOverflow(cell->overflow, cell->overflowBytes);
-    if (code != SQLITE_OK) return code;
+    if (cell->overflow != 0) overflowing.push_back(*cell);
   }
   // A list of free pieces, of which each begins with the place of the next one and its length.
   std::size_t last = 0;
   for (std::size_t at = number16(bytes, header + 1); at != 0; at = number16(bytes, at)) {
-    if (at <= last || at < content || at + 4 > usable_) return SQLITE_CORRUPT;
+    if (at <= last || at < content || at + 4 > pageBytes_) return kUnexpectedForm;
     used.emplace_back(at, at + 4);
     last = at;
   }
   std::ranges::sort(used);
+  // All of the page is known now. Nothing was changed before.
   SqliteCode code = SQLITE_OK;
+  for (const Cell& cell : overflowing) {
+    if (code == SQLITE_OK) code = cleanOverflow(cell.overflow, cell.overflowBytes);
+  }
   std::size_t free = content;
   for (const auto& [begin, end] : used) {
     if (code == SQLITE_OK && begin > free) code = zero(number, page, free, begin);
     free = std::max(free, end);
   }
-  return code == SQLITE_OK && free < usable_ ? zero(number, page, free, usable_) : code;
+  return code == SQLITE_OK && free < pageBytes_ ? zero(number, page, free, pageBytes_) : code;
 }
 
 // Cleans the end of the last overflow page of a payload that has `bytes` in overflow pages.
 SqliteCode PageCleaner::cleanOverflow(std::uint32_t first, std::uint64_t bytes) {
-  const std::uint64_t perPage = usable_ - 4;
+  const std::uint64_t perPage = pageBytes_ - 4;
+  // The pages of a damaged chain may form a ring.
+  if (bytes > pages_ * perPage) return kUnexpectedForm;
   std::uint32_t number = first;
   Page page;
   for (;; bytes -= perPage) {
-    if (number < 2 || number > pages_) return SQLITE_CORRUPT;
+    if (number < 2 || number > pages_) return kUnexpectedForm;
     const bool isLast = bytes <= perPage;
     if (isLast) break;
     std::array<unsigned char, 4> next{};
@@ -239,7 +242,7 @@ SqliteCode PageCleaner::cleanOverflow(std::uint32_t first, std::uint64_t bytes) 
     number = number32(next, 0);
   }
   const SqliteCode code = read(number, page);
-  return code == SQLITE_OK ? zero(number, page, 4 + bytes, usable_) : code;
+  return code == SQLITE_OK ? zero(number, page, 4 + bytes, pageBytes_) : code;
 }
 
 SqliteCode PageCleaner::read(std::uint32_t number, Page& page) {

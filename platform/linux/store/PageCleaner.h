@@ -22,16 +22,21 @@ namespace halvox::platform::linux_ {
 //
 // Two passes over the file: SQLite may copy a whole page between two steps, with its unused space.
 // The connection must have secure_delete enabled until the last step, so that free pages that are
-// used again bring nothing back. Needs a database with a page map (auto_vacuum); see canClean().
+// used again bring nothing back. Needs a database with a page map (auto_vacuum) and without
+// reserved bytes, in which an extension of SQLite may keep a checksum of the page; see canClean().
 // Belongs to the writer's thread.
 class PageCleaner {
  public:
+  // A page is not as SQLite makes it. This is not SQLITE_CORRUPT, at which the store would set the
+  // database aside, because SQLite itself has not complained.
+  static constexpr SqliteCode kUnexpectedForm = SQLITE_FORMAT;
+
   explicit PageCleaner(std::filesystem::path database) : database_(std::move(database)) {}
 
   [[nodiscard]] static bool canClean(Database& database);
   // Cleans some pages. Sets `more` to whether pages remain, and `isHeld` to whether a reader held
   // the log, in which case no page was cleaned. Do not call inside a transaction, or while a
-  // statement is being stepped.
+  // statement is being stepped. Returns an error of SQLite, or kUnexpectedForm.
   [[nodiscard]] SqliteCode cleanOnce(Database& database, bool& more, bool& isHeld);
 
  private:
@@ -51,7 +56,6 @@ class PageCleaner {
   const std::filesystem::path database_;
   sqlite3_file* file_ = nullptr;  // of the connection, during a step
   std::uint32_t pageBytes_ = 0;
-  std::uint32_t usable_ = 0;  // of a page; the rest is for extensions of SQLite
   std::uint32_t pages_ = 0;
   std::uint32_t next_ = 1;  // the page to clean next
   int pass_ = 0;

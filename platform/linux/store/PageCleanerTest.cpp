@@ -94,8 +94,51 @@ TEST_F(PageCleanerTest, DamagedPagesAreReportedAndNotChanged) {
   writeFile(file_, content);
   ASSERT_EQ(database_.open(file_, DatabaseAccess::kReadWrite), SQLITE_OK);
 
-  EXPECT_EQ(clean(), SQLITE_CORRUPT);
+  EXPECT_EQ(clean(), PageCleaner::kUnexpectedForm);
   EXPECT_EQ(readFile(file_), content);
+}
+
+TEST_F(PageCleanerTest, OverflowPagesThatFormARingAreReported) {
+  run("INSERT INTO t VALUES (1, 'name', CAST(zeroblob(1 << 20) AS TEXT))");
+  run("PRAGMA wal_checkpoint(TRUNCATE)");
+  std::string content = readFile(file_);
+  const auto root = static_cast<std::size_t>(
+      std::stoll(rows(file_, "SELECT rootpage FROM sqlite_schema WHERE name = 't'").at(0)));
+  const std::size_t page = (root - 1) * 1024;
+  const auto byteAt = [&](std::size_t at) {
+    return static_cast<std::size_t>(static_cast<unsigned char>(content.at(at)));
+  };
+  const std::size_t cell = page + byteAt(page + 8) * 256 + byteAt(page + 9);
+  // The length takes 3 bytes. A whole number of pages more leaves the cell as long as it is.
+  std::size_t length = byteAt(cell) % 128 << 14U | byteAt(cell + 1) % 128 << 7U | byteAt(cell + 2);
+  ASSERT_GT(length, std::size_t{1} << 20U);
+  length += std::size_t{900} * 1020;
+  content.at(cell) = static_cast<char>(length >> 14U | 128U);
+  content.at(cell + 1) = static_cast<char>(length >> 7U | 128U);
+  content.at(cell + 2) = static_cast<char>(length % 128);
+  // The cell ends the page, and names the first overflow page, which now names itself.
+  const std::size_t first = byteAt(page + 1022) * 256 + byteAt(page + 1023);
+  content.at((first - 1) * 1024 + 2) = static_cast<char>(first / 256);
+  content.at((first - 1) * 1024 + 3) = static_cast<char>(first % 256);
+  database_.close();
+  writeFile(file_, content);
+  ASSERT_EQ(database_.open(file_, DatabaseAccess::kReadWrite), SQLITE_OK);
+
+  EXPECT_EQ(clean(), PageCleaner::kUnexpectedForm);
+}
+
+TEST_F(PageCleanerTest, ADatabaseWithReservedBytesCannotBeCleaned) {
+  EXPECT_TRUE(PageCleaner::canClean(database_));
+  int reserved = 8;
+  const std::filesystem::path other = scratch_.path() / "reserved.db";
+  writeFile(other, "");
+  Database database;
+  ASSERT_EQ(database.open(other, DatabaseAccess::kReadWrite), SQLITE_OK);
+  ASSERT_EQ(sqlite3_file_control(database.get(), "main", SQLITE_FCNTL_RESERVE_BYTES, &reserved),
+            SQLITE_OK);
+  ASSERT_EQ(database.execute("PRAGMA auto_vacuum = INCREMENTAL; CREATE TABLE t(id)"), SQLITE_OK);
+
+  EXPECT_FALSE(PageCleaner::canClean(database));
 }
 
 TEST_F(PageCleanerTest, AReaderOfTheLogDelaysIt) {

@@ -9,6 +9,7 @@
 #include <malloc.h>
 
 #include "platform/linux/base/ThreadSetup.h"
+#include "platform/linux/store/PageCleaner.h"
 #include "platform/linux/store/StoreLog.h"
 
 namespace halvox::platform::linux_ {
@@ -407,8 +408,13 @@ void SqliteStore::eraseOnce() {
   errno = 0;
   const SqliteCode code = erase_.runOnce(database_, kinds_);
   if (code != SQLITE_OK) {
-    erase_.fail(sqlite3_errstr(code));
-    fail(code, "cannot erase in the database");
+    erase_.fail(StoreErase::problemOf(code));
+    if (code == PageCleaner::kUnexpectedForm) {
+      kLog.error("", files_.database().native(),
+                 ": cannot erase in the database: ", StoreErase::problemOf(code));
+    } else {
+      fail(code, "cannot erase in the database");
+    }
     if (database_.isOpen()) StoreErase::resetConnection(database_);
     return;
   }

@@ -108,6 +108,11 @@ void StoreErase::resetConnection(Database& database) {
   static_cast<void>(clearFreed(database, false));
 }
 
+std::string StoreErase::problemOf(SqliteCode code) {
+  if (code != PageCleaner::kUnexpectedForm) return sqlite3_errstr(code);
+  return "a page of the database has an unexpected form; run \"halvoxctl verify\"";
+}
+
 void StoreErase::fail(const std::string& problem) {
   release();
   const MutexLock lock(mutex_);
@@ -250,7 +255,7 @@ Result<EraseState, StoreError> eraseStore(const ErasePlaces& places, const Store
   if (code == SQLITE_OK) return erase.state();
   return Failure<StoreError>{
       StoreError::kCannotOpen,
-      files.database().native() + ": cannot erase in the database: " + sqlite3_errstr(code)};
+      files.database().native() + ": cannot erase in the database: " + StoreErase::problemOf(code)};
 }
 
 }  // namespace halvox::platform::linux_

@@ -57,6 +57,8 @@ class StoreErase {
   // back and calls fail().
   [[nodiscard]] SqliteCode runOnce(Database& database, std::span<RecordKind* const> kinds)
       HALVOX_EXCLUDES(mutex_);
+  // Returns what an error of runOnce() means, for people.
+  static std::string problemOf(SqliteCode code);
   // Undoes the setting of the connection that an erasure needs. Call it after an error was read.
   static void resetConnection(Database& database);
   // Ends the erasure that runs, with a problem.

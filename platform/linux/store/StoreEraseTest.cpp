@@ -66,6 +66,36 @@ class StoreEraseTest : public StoreFixture {
   double stamp_ = kNow;
 };
 
+TEST_F(StoreEraseTest, APageOfUnexpectedFormFailsTheErasureAndNotTheStore) {
+  start();
+  message("player", 1, "one");
+  message("browser", 2, "two");
+  stop();
+  // No query reads this table, so that SQLite itself finds nothing wrong.
+  const std::string page = rows(database(), "PRAGMA page_size").at(0);
+  {
+    Database open;
+    ASSERT_EQ(open.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
+    ASSERT_EQ(open.execute("CREATE TABLE unread (n); INSERT INTO unread VALUES (1);"
+                           "PRAGMA wal_checkpoint(TRUNCATE)"),
+              SQLITE_OK);
+  }
+  const std::string root =
+      rows(database(), "SELECT rootpage FROM sqlite_schema WHERE name = 'unread'").at(0);
+  std::string content = readFile(database());
+  content.at((std::stoul(root) - 1) * std::stoul(page) + 3) = '\x7f';  // the number of cells
+  writeFile(database(), content);
+  start();
+
+  const EraseState state = erase({.application = "player"});
+
+  EXPECT_THAT(state.problem, HasSubstr("halvoxctl verify"));
+  EXPECT_THAT(texts(), ElementsAre("two", "link two"));
+  message("browser", 2, "three");
+  EXPECT_TRUE(allIsStored());
+  EXPECT_THAT(texts(), ElementsAre("two", "three", "link two", "link three"));
+}
+
 TEST_F(StoreEraseTest, AnApplicationGoesAndOthersStay) {
   start();
   message("player", 1, "SECRET one");
