@@ -46,12 +46,14 @@ SqliteCode BlockScan::begin() {
                  std::nullopt, stored_);
   last_ = filter_.before.has_value() ? std::min(stored_, *filter_.before - 1) : stored_;
   next_ = std::max<std::int64_t>(filter_.after + 1, 1);
+  if (code == SQLITE_OK) code = findRanges();
+  // Look for a gap after the ranges are known. If rows are removed before that, the ranges begin
+  // after these rows, and reading would not notice that they are missing.
   if (code == SQLITE_OK && filter_.after > 0) {
     std::int64_t first = 0;
     code = readNumber("SELECT ifnull(min(id), 0) FROM message_blocks", std::nullopt, first);
     hasGap_ = first > next_;
   }
-  if (code == SQLITE_OK) code = findRanges();
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
   if (code != SQLITE_OK) return code;
   if (filter_.order == RecordOrder::kNewestFirst) {
